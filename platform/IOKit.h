@@ -1,0 +1,50 @@
+// The I/O registry and user clients in the manner of IOKit: the first service
+// that matches a class name, a property copied as a new owned value, a
+// connection opened with a return code, a structure method called with an
+// input buffer, the connection closed.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+
+#include "platform/Value.h"
+
+namespace kolvrand {
+
+using kern_return_t = int32_t;
+using IOReturn = int32_t;
+using mach_port_t = uint32_t;
+using task_port_t = uint32_t;
+// Registry services live as long as the process: a handle needs no release.
+using io_service_t = uint32_t;
+using io_connect_t = uint32_t;
+
+inline constexpr kern_return_t KERN_SUCCESS = 0;
+inline constexpr IOReturn kIOReturnSuccess = 0;
+inline constexpr IOReturn kIOReturnError = static_cast<IOReturn>(0xe00002bc);
+inline constexpr IOReturn kIOReturnBadArgument = static_cast<IOReturn>(0xe00002c2);
+inline constexpr IOReturn kIOReturnNotOpen = static_cast<IOReturn>(0xe00002cd);
+inline constexpr IOReturn kIOReturnUnsupported = static_cast<IOReturn>(0xe00002c7);
+inline constexpr mach_port_t kIOMasterPortDefault = 0;
+
+task_port_t mach_task_self();
+
+struct IOMatchingDictionary {
+  std::string className;
+};
+
+IOMatchingDictionary IOServiceMatching(const char* className);
+// The first matching service, or 0.
+io_service_t IOServiceGetMatchingService(mach_port_t mainPort, IOMatchingDictionary matching);
+// A copy of the property, or nullopt when the service has none by that name.
+std::optional<Value> IORegistryEntryCreateCFProperty(io_service_t entry, const std::string& key);
+kern_return_t IOServiceOpen(io_service_t service, task_port_t owningTask, uint32_t type,
+                            io_connect_t* connect);
+kern_return_t IOConnectCallStructMethod(io_connect_t connection, uint32_t selector,
+                                        const void* inputStruct, size_t inputStructCnt,
+                                        void* outputStruct, size_t* outputStructCnt);
+kern_return_t IOServiceClose(io_connect_t connect);
+
+}  // namespace kolvrand

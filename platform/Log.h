@@ -1,0 +1,146 @@
+// Leveled logging in the manner of os_log: one named log per subsystem and
+// category, printf-style formats in which %@ prints an object's description
+// (a nil object as "(null)"). A message is formatted only when its level is
+// enabled for its log.
+#pragma once
+
+#include <concepts>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <type_traits>
+#include <variant>
+
+namespace kolvrand {
+
+enum class LogLevel : uint8_t { Error = 0, Default = 1, Debug = 2 };
+
+// Where formatted messages go. The default sink is chosen once per process:
+// journald when stderr is the journal, else one line per message on stderr.
+class LogSink {
+ public:
+  virtual ~LogSink() = default;
+  // `message` is the formatted text, a trailing line feed included if the
+  // format had one; sinks decide how to end the line.
+  virtual void write(LogLevel level, std::string_view subsystem, std::string_view category,
+                     std::string_view message) = 0;
+};
+
+// Replaces the process's sink (tests capture messages this way); nullptr
+// restores the default.
+void setLogSink(std::shared_ptr<LogSink> sink);
+
+// Sets which levels are enabled, in the syntax of KOLVRAND_LOG_LEVEL: a level
+// for all categories ("debug"), or a comma list of CATEGORY=LEVEL and LEVEL
+// items, later items winning ("default,main=debug"). Levels: error, default,
+// debug; each enables itself and the levels above it. Unknown items are
+// ignored. An empty spec restores the default (error and default enabled).
+// The environment variable is read once, at the first log created, unless
+// this was called before.
+void setLogLevelSpec(std::string_view spec);
+
+class OSLog {
+ public:
+  OSLog(std::string subsystem, std::string category)
+      : subsystem_(std::move(subsystem)), category_(std::move(category)) {}
+  const std::string& subsystem() const { return subsystem_; }
+  const std::string& category() const { return category_; }
+  bool enabled(LogLevel level) const;
+
+ private:
+  std::string subsystem_;
+  std::string category_;
+};
+
+using os_log_t = std::shared_ptr<const OSLog>;
+
+os_log_t os_log_create(const char* subsystem, const char* category);
+
+// One formatting argument. Objects are carried by their description, taken
+// only when the message is enabled.
+struct LogArg {
+  struct Object {
+    std::optional<std::string> text;  // nullopt prints "(null)"
+  };
+  std::variant<int64_t, uint64_t, double, const void*, const char*, std::string_view, Object> v;
+};
+
+template <typename T>
+concept Describable = requires(const T& t) {
+  { t.description() } -> std::convertible_to<std::string>;
+};
+
+template <typename T>
+LogArg makeLogArg(const T& a) {
+  using U = std::remove_cvref_t<T>;
+  if constexpr (std::is_same_v<U, bool>) {
+    return {int64_t{a}};
+  } else if constexpr (std::is_integral_v<U> && std::is_signed_v<U>) {
+    return {int64_t{a}};
+  } else if constexpr (std::is_integral_v<U>) {
+    return {uint64_t{a}};
+  } else if constexpr (std::is_enum_v<U>) {
+    return {static_cast<int64_t>(a)};
+  } else if constexpr (std::is_floating_point_v<U>) {
+    return {double{a}};
+  } else if constexpr (std::is_same_v<U, const char*> || std::is_same_v<U, char*>) {
+    return {static_cast<const char*>(a)};
+  } else if constexpr (std::is_array_v<U>) {
+    return {static_cast<const char*>(a)};
+  } else if constexpr (std::is_same_v<U, std::string> || std::is_same_v<U, std::string_view>) {
+    return {std::string_view(a)};
+  } else if constexpr (std::is_same_v<U, std::nullptr_t>) {
+    return {LogArg::Object{}};
+  } else if constexpr (std::is_same_v<U, std::optional<std::string>>) {
+    return {LogArg::Object{a}};
+  } else if constexpr (Describable<U>) {
+    return {LogArg::Object{std::string(a.description())}};
+  } else if constexpr (requires { a.get(); } && Describable<std::remove_cvref_t<decltype(*a)>>) {
+    // shared_ptr / unique_ptr to an object: nil prints "(null)"
+    return a ? LogArg{LogArg::Object{std::string(a->description())}} : LogArg{LogArg::Object{}};
+  } else if constexpr (std::is_pointer_v<U>) {
+    return {static_cast<const void*>(a)};
+  } else {
+    static_assert(sizeof(U) == 0, "unsupported log argument");
+  }
+}
+
+// Formats `format` with printf semantics for the conversions d i u x X o c s p
+// f e g %, with the length modifiers hh h l ll j z t, flags, width and
+// precision; %@ prints an object (or a string) and "(null)" for nil; %s of a
+// null C string prints "(null)". A conversion without a matching argument
+// prints nothing; surplus arguments are ignored.
+std::string formatLogMessage(std::string_view format, std::span<const LogArg> args);
+
+// Formats and hands the message to the sink; callers have checked the level.
+void emitLog(const OSLog& log, LogLevel level, std::string_view format,
+             std::span<const LogArg> args);
+
+template <typename... Args>
+void os_log_with_level(const os_log_t& log, LogLevel level, const char* format,
+                       const Args&... args) {
+  if (!log || !log->enabled(level)) return;
+  const LogArg packed[sizeof...(Args) + 1] = {makeLogArg(args)..., LogArg{int64_t{0}}};
+  emitLog(*log, level, format, std::span<const LogArg>(packed, sizeof...(Args)));
+}
+
+template <typename... Args>
+void os_log_error(const os_log_t& log, const char* format, const Args&... args) {
+  os_log_with_level(log, LogLevel::Error, format, args...);
+}
+
+// os_log proper: the default level.
+template <typename... Args>
+void os_log(const os_log_t& log, const char* format, const Args&... args) {
+  os_log_with_level(log, LogLevel::Default, format, args...);
+}
+
+template <typename... Args>
+void os_log_debug(const os_log_t& log, const char* format, const Args&... args) {
+  os_log_with_level(log, LogLevel::Debug, format, args...);
+}
+
+}  // namespace kolvrand

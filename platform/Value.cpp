@@ -1,0 +1,197 @@
+#include "platform/Value.h"
+
+#include <bit>
+#include <charconv>
+#include <cmath>
+#include <limits>
+
+namespace kolvrand {
+
+namespace {
+
+template <typename Int>
+Int saturate(double d) {
+  if (std::isnan(d)) return 0;
+  if (d <= static_cast<double>(std::numeric_limits<Int>::min()))
+    return std::numeric_limits<Int>::min();
+  if (d >= static_cast<double>(std::numeric_limits<Int>::max()))
+    return std::numeric_limits<Int>::max();
+  return static_cast<Int>(d);
+}
+
+template <typename T>
+std::string shortest(T v) {
+  if (std::isnan(v)) return "nan";
+  if (std::isinf(v)) return v < 0 ? "-inf" : "inf";
+  char buf[64];
+  auto r = std::to_chars(buf, buf + sizeof buf, v);
+  return std::string(buf, r.ptr);
+}
+
+void appendQuoted(std::string& out, std::string_view s) {
+  out += '"';
+  for (unsigned char c : s) {
+    switch (c) {
+      case '"': out += "\\\""; break;
+      case '\\': out += "\\\\"; break;
+      case '\n': out += "\\n"; break;
+      case '\t': out += "\\t"; break;
+      default:
+        if (c < 0x20) {
+          static const char* hex = "0123456789abcdef";
+          out += "\\u00";
+          out += hex[c >> 4];
+          out += hex[c & 15];
+        } else {
+          out += static_cast<char>(c);
+        }
+    }
+  }
+  out += '"';
+}
+
+void describe(std::string& out, const Value& v) {
+  switch (v.type()) {
+    case Value::Type::Boolean: out += *v.asBoolean() ? "true" : "false"; break;
+    case Value::Type::Number: out += v.asNumber()->description(); break;
+    case Value::Type::String: appendQuoted(out, *v.asString()); break;
+    case Value::Type::Data: {
+      static const char* hex = "0123456789abcdef";
+      out += '<';
+      for (uint8_t b : *v.asData()) {
+        out += hex[b >> 4];
+        out += hex[b & 15];
+      }
+      out += '>';
+      break;
+    }
+    case Value::Type::Array: {
+      out += '[';
+      bool first = true;
+      for (const Value& e : *v.asArray()) {
+        if (!first) out += ", ";
+        first = false;
+        describe(out, e);
+      }
+      out += ']';
+      break;
+    }
+    case Value::Type::Dictionary: {
+      out += '{';
+      bool first = true;
+      for (const auto& [k, e] : *v.asDictionary()) {
+        if (!first) out += ", ";
+        first = false;
+        appendQuoted(out, k);
+        out += ": ";
+        describe(out, e);
+      }
+      out += '}';
+      break;
+    }
+  }
+}
+
+}  // namespace
+
+int64_t Number::int64Value() const {
+  switch (kind_) {
+    case Kind::Signed: return s_;
+    case Kind::Unsigned: return static_cast<int64_t>(u_);
+    case Kind::Float: return saturate<int64_t>(f_);
+    case Kind::Double: return saturate<int64_t>(d_);
+  }
+  return 0;
+}
+
+uint64_t Number::uint64Value() const {
+  switch (kind_) {
+    case Kind::Signed: return static_cast<uint64_t>(s_);
+    case Kind::Unsigned: return u_;
+    case Kind::Float: return saturate<uint64_t>(f_);
+    case Kind::Double: return saturate<uint64_t>(d_);
+  }
+  return 0;
+}
+
+double Number::doubleValue() const {
+  switch (kind_) {
+    case Kind::Signed: return static_cast<double>(s_);
+    case Kind::Unsigned: return static_cast<double>(u_);
+    case Kind::Float: return f_;
+    case Kind::Double: return d_;
+  }
+  return 0;
+}
+
+std::string Number::description() const {
+  switch (kind_) {
+    case Kind::Signed: return std::to_string(s_);
+    case Kind::Unsigned: return std::to_string(u_);
+    case Kind::Float: return shortest(f_);
+    case Kind::Double: return shortest(d_);
+  }
+  return {};
+}
+
+bool Number::operator==(const Number& other) const {
+  if (kind_ != other.kind_) return false;
+  switch (kind_) {
+    case Kind::Signed: return s_ == other.s_;
+    case Kind::Unsigned: return u_ == other.u_;
+    case Kind::Float: return std::bit_cast<uint32_t>(f_) == std::bit_cast<uint32_t>(other.f_);
+    case Kind::Double: return std::bit_cast<uint64_t>(d_) == std::bit_cast<uint64_t>(other.d_);
+  }
+  return false;
+}
+
+Dictionary::Dictionary(std::initializer_list<Entry> entries) {
+  for (const auto& e : entries) set(e.first, e.second);
+}
+
+const Value* Dictionary::find(std::string_view key) const {
+  for (const auto& e : entries_)
+    if (e.first == key) return &e.second;
+  return nullptr;
+}
+
+Value* Dictionary::find(std::string_view key) {
+  for (auto& e : entries_)
+    if (e.first == key) return &e.second;
+  return nullptr;
+}
+
+void Dictionary::set(std::string key, Value value) {
+  if (Value* existing = find(key)) {
+    *existing = std::move(value);
+    return;
+  }
+  entries_.emplace_back(std::move(key), std::move(value));
+}
+
+bool Dictionary::erase(std::string_view key) {
+  for (auto it = entries_.begin(); it != entries_.end(); ++it) {
+    if (it->first == key) {
+      entries_.erase(it);
+      return true;
+    }
+  }
+  return false;
+}
+
+bool Dictionary::operator==(const Dictionary& other) const {
+  if (size() != other.size()) return false;
+  for (const auto& [k, v] : entries_) {
+    const Value* o = other.find(k);
+    if (!o || !(*o == v)) return false;
+  }
+  return true;
+}
+
+std::string Value::description() const {
+  std::string out;
+  describe(out, *this);
+  return out;
+}
+
+}  // namespace kolvrand
