@@ -1,0 +1,57 @@
+#include "daemon/BatteryModelTask.h"
+
+#include <vector>
+
+#include "pipeline/DaemonIdentifier.h"
+#include "platform/Sysctl.h"
+#include "platform/Utf8.h"
+
+namespace kolvrand {
+
+namespace {
+
+// The kernel's boot-session UUID, or nullopt when it cannot be read or is not
+// UTF-8.
+std::optional<std::string> currentBootSessionUUID() {
+  size_t size = 0;
+  if (sysctlbyname("kern.bootsessionuuid", nullptr, &size, nullptr, 0) != 0) return std::nullopt;
+  // One zero byte beyond the value, so bytes without a NUL still end.
+  std::vector<char> buffer(size + 1, '\0');
+  if (sysctlbyname("kern.bootsessionuuid", buffer.data(), &size, nullptr, 0) != 0)
+    return std::nullopt;
+  return stringWithUTF8String(buffer.data());
+}
+
+}  // namespace
+
+void runBatteryModelTask(const os_log_t& mainLog, BatteryModelDataHandler* handler) {
+  // Its own defaults object, not the handler's.
+  std::shared_ptr<NSUserDefaults> defaults = NSUserDefaults::initWithSuiteName(DaemonIdentifier);
+  if (!defaults) {
+    os_log_error(mainLog, "Could not allocate defaults\n");
+    return;
+  }
+
+  std::optional<std::string> bootUUID = currentBootSessionUUID();
+  if (!bootUUID) {
+    os_log_error(mainLog, "Unable to get current boot UUID\n");
+    return;
+  }
+
+  if (defaults->stringForKey("savedBootUUID") == bootUUID) {
+    os_log(mainLog, "Main Unchanged boot UUID. Skipping battery model task\n");
+    return;
+  }
+
+  uint32_t chemID = handler ? handler->getBatteryChemID() : 0;
+  os_log_debug(mainLog, "Battery data upload run for chemId 0x%lx\n", static_cast<uint64_t>(chemID));
+
+  if (handler && handler->moveBatteryModelDataFromDiskToKext(chemID)) {
+    os_log(mainLog, "Battery data upload succeeded\n");
+    defaults->setObject(*bootUUID, "savedBootUUID");
+  } else {
+    os_log_error(mainLog, "Battery data upload failed\n");
+  }
+}
+
+}  // namespace kolvrand

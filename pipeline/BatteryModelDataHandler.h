@@ -1,0 +1,60 @@
+// The process-wide object that carries the battery-model pipeline: battery
+// identity, device type, model file, kernel record, upload and verification.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/Defaults.h"
+#include "platform/Log.h"
+#include "platform/Value.h"
+
+namespace kolvrand {
+
+class OTAParamRC;
+struct KextBatteryModel;
+
+class BatteryModelDataHandler {
+ public:
+  // The one shared handler, created on first use under a once-only guard.
+  static std::shared_ptr<BatteryModelDataHandler> sharedInstance();
+  // A handler with its own defaults (suite DaemonIdentifier; nil when the
+  // suite cannot be opened) and its "batteryModelDataHandling" log.
+  static std::shared_ptr<BatteryModelDataHandler> init();
+
+  // Battery identity, from the battery driver's "BatteryData".
+  int32_t getIntValueForKeyFromBatteryData(const char* key);
+  uint32_t getBatteryChemID();
+  std::string getSpecialCaseBatteryModelIdentifier(uint32_t chemID);
+
+  // Device type and model file.
+  std::optional<std::string> getDeviceType(uint32_t chemID);
+  std::optional<std::string> getBatteryModelFileURLString(uint32_t chemID);
+  std::shared_ptr<OTAParamRC> loadProtobufModelWithFileName(
+      const std::optional<std::string>& fileName);
+
+  // The kernel record, its upload and verification.
+  std::unique_ptr<KextBatteryModel> createKextModelFromProtobufModel(const OTAParamRC* protobufModel);
+  bool moveBatteryModelDataFromDiskToKext(uint32_t chemID);
+  bool setBatteryModelDataToKernel(const KextBatteryModel* kextModel);
+  // Stores an owned copy of the driver's "KVRVector" dictionary in *dict.
+  bool getKVRDebugDict(std::optional<Dictionary>* dict);
+  bool verifyHashData(const uint8_t* sentHash);
+
+  // Kept for the driver interface's symmetry; nothing calls them.
+  bool setBatteryModelDataToDisk() { return true; }
+  bool getBatteryModelDataFromKernel() { return true; }
+
+  const std::shared_ptr<NSUserDefaults>& defaults() const { return defaults_; }
+  void setDefaults(std::shared_ptr<NSUserDefaults> d) { defaults_ = std::move(d); }
+  const os_log_t& log() const { return log_; }
+  void setLog(os_log_t l) { log_ = std::move(l); }
+
+ private:
+  std::shared_ptr<NSUserDefaults> defaults_;
+  os_log_t log_;
+};
+
+}  // namespace kolvrand

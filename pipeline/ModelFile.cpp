@@ -1,0 +1,66 @@
+// Locating the model file for the battery and decoding its first message.
+#include <cstdio>
+
+#include "model/OTAParamRC.h"
+#include "pipeline/BatteryModelDataHandler.h"
+#include "pipeline/PBStreamReader.h"
+#include "platform/FileManager.h"
+
+namespace kolvrand {
+
+std::optional<std::string> BatteryModelDataHandler::getBatteryModelFileURLString(
+    uint32_t chemID) {
+  static constexpr const char* kMethod = "-[BatteryModelDataHandler getBatteryModelFileURLString:]";
+  NSFileManager& fileManager = NSFileManager::defaultManager();
+
+  std::optional<std::string> deviceType = getDeviceType(chemID);
+  if (!deviceType) {
+    os_log_error(log_, "%s <Error> deviceType nil", kMethod);
+    return std::nullopt;
+  }
+  std::optional<NSURL> workingDirURL =
+      fileManager.URLForDirectory(NSLibraryDirectory, NSSystemDomainMask, nullptr, false, nullptr);
+  if (!workingDirURL) {
+    os_log_error(log_, "%s <Error> workingDirURL nil", kMethod);
+    return std::nullopt;
+  }
+  // Only now, once a device type and a root are known, is the serial number read.
+  const std::string suffix = getSpecialCaseBatteryModelIdentifier(chemID);
+
+  char fileName[16];
+  std::snprintf(fileName, sizeof fileName, "%x", chemID);
+  const NSURL url = *workingDirURL / "KVR" / "BatteryModels" / *deviceType /
+                    (std::string(fileName) + suffix + ".rcmodel");
+  std::string path = url.string();
+
+  os_log_debug(log_, "%s workingDirURL resource: %@ \n", kMethod, path);
+  if (!fileManager.fileExistsAtPath(path)) {
+    os_log_error(log_, "%s <Error> file not present: %@", kMethod, path);
+    return std::nullopt;
+  }
+  return path;
+}
+
+std::shared_ptr<OTAParamRC> BatteryModelDataHandler::loadProtobufModelWithFileName(
+    const std::optional<std::string>& fileName) {
+  static constexpr const char* kMethod =
+      "-[BatteryModelDataHandler loadProtobufModelWithFileName:]";
+  if (!fileName) {
+    os_log_error(log_, "%s <Error> fileName nil", kMethod);
+    return nullptr;
+  }
+  NSError error;
+  auto messages = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(*fileName, &error);
+  if (!messages) {
+    os_log_error(log_, "%s <Error> readContent error is %@", kMethod, error.localizedDescription);
+    return nullptr;
+  }
+  if (messages->empty()) {
+    os_log_error(log_, "%s <Error> protobufModelRCParams nil", kMethod);
+    return nullptr;
+  }
+  // Further messages in the file are not used.
+  return std::move(messages->front());
+}
+
+}  // namespace kolvrand

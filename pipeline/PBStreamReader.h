@@ -1,0 +1,72 @@
+// Reads a model file: a sequence of messages, each preceded by its length as a
+// varint (the framing of writeDelimitedTo / parseDelimitedFrom, so any protocol
+// buffer toolchain can write one).
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string>
+#include <vector>
+
+#include "model/PBDataReader.h"
+
+namespace kolvrand {
+
+struct NSError {
+  std::string localizedDescription;
+  const std::string& description() const { return localizedDescription; }
+};
+
+class PBStreamReader {
+ public:
+  // Far above a full model (about 40 KB); anything larger is refused unread.
+  static constexpr size_t kMaxFileSize = 4 * 1024 * 1024;
+
+  // The whole file in one read, or an error when it cannot be opened, is not a
+  // regular file or is larger than kMaxFileSize.
+  static std::optional<std::vector<uint8_t>> readFile(const std::string& path, NSError* error);
+
+  // The messages of `bytes` in order; an empty input is an empty list. On a
+  // length or message cut short, a length past the end, or a message whose
+  // read fails: nullopt and *error describes where.
+  template <typename Message>
+  static std::optional<std::vector<std::shared_ptr<Message>>> readProtoBuffersOfClass(
+      std::span<const uint8_t> bytes, NSError* error) {
+    std::vector<std::shared_ptr<Message>> messages;
+    size_t offset = 0;
+    while (offset < bytes.size()) {
+      std::span<const uint8_t> body;
+      if (!nextFrame(bytes, &offset, &body, messages.size(), error)) return std::nullopt;
+      auto message = std::make_shared<Message>();
+      PBDataReader reader(body.data(), body.size());
+      if (!message->readFrom(reader)) {
+        if (error) *error = messageError(messages.size(), offset - body.size());
+        return std::nullopt;
+      }
+      messages.push_back(std::move(message));
+    }
+    return messages;
+  }
+
+  template <typename Message>
+  static std::optional<std::vector<std::shared_ptr<Message>>> readProtoBuffersOfClass(
+      const std::string& path, NSError* error) {
+    std::optional<std::vector<uint8_t>> bytes = readFile(path, error);
+    if (!bytes) return std::nullopt;
+    auto messages = readProtoBuffersOfClass<Message>(std::span<const uint8_t>(*bytes), error);
+    if (!messages && error) error->localizedDescription = path + ": " + error->localizedDescription;
+    return messages;
+  }
+
+ private:
+  // Reads the length of message `index` at *offset and returns its body;
+  // *offset moves past the body.
+  static bool nextFrame(std::span<const uint8_t> bytes, size_t* offset,
+                        std::span<const uint8_t>* body, size_t index, NSError* error);
+  static NSError messageError(size_t index, size_t offset);
+};
+
+}  // namespace kolvrand
