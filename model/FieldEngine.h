@@ -1,0 +1,38 @@
+// The message operations, written once over a field table and the message's
+// storage. Fields are visited in table order (ascending field number).
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+
+#include "model/FieldStorage.h"
+#include "model/FieldTable.h"
+#include "model/PBDataReader.h"
+#include "model/PBDataWriter.h"
+#include "platform/Value.h"
+
+namespace kolvrand::detail {
+
+// The read function: decodes fields up to the reader's limit. Known fields are
+// decoded by their kind whatever wire type they carry (only a repeated field
+// looks at it, to tell a packed run); unknown ones are skipped. Ends at the
+// limit, at an error, or at an end-group tag; true when no error was set.
+bool readFields(const MessageTable& table, MutableFields fields, PBDataReader& reader);
+
+void writeFields(const MessageTable& table, ConstFields fields, PBDataWriter& writer);
+size_t encodedFieldsSize(const MessageTable& table, ConstFields fields);
+
+// copyTo: the target shares the source's sub-messages and takes its non-empty
+// lists, chemID-like values and set optional values; the rest stays.
+void copyFields(const MessageTable& table, ConstFields from, MutableFields to);
+// Into a new message: an independent tree of exactly the source's present fields.
+void deepCopyFields(const MessageTable& table, ConstFields from, MutableFields to);
+// mergeFrom: sub-messages merged recursively (or shared when the target has
+// none), lists appended, set values overwritten.
+void mergeFields(const MessageTable& table, ConstFields from, MutableFields to);
+
+bool equalFields(const MessageTable& table, ConstFields a, ConstFields b);
+uint64_t hashFields(const MessageTable& table, ConstFields fields);
+Value dictionaryOfFields(const MessageTable& table, ConstFields fields);
+
+}  // namespace kolvrand::detail

@@ -1,0 +1,7 @@
+#include "model/OTABMUResistance.h"
+
+namespace kolvrand {
+
+KVR_DEFINE_FIELD_TABLE(OTABMUResistance, KVR_OTA_BMU_RESISTANCE_FIELDS)
+
+}  // namespace kolvrand

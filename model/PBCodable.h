@@ -1,0 +1,56 @@
+// The base of every message class: what a message can do without its caller
+// knowing which message it is.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "model/PBDataReader.h"
+#include "model/PBDataWriter.h"
+#include "platform/Value.h"
+
+namespace kolvrand {
+
+class PBCodable {
+ public:
+  PBCodable() = default;
+  virtual ~PBCodable() = default;
+  // Messages are shared by std::shared_ptr and duplicated with copy(), never
+  // copied as C++ values.
+  PBCodable(const PBCodable&) = delete;
+  PBCodable& operator=(const PBCodable&) = delete;
+
+  virtual const char* className() const = 0;
+
+  // Decodes fields from the reader's position up to its limit into this
+  // message; true when the reader's error flag is clear at the end.
+  virtual bool readFrom(PBDataReader& reader) = 0;
+  virtual void writeTo(PBDataWriter& writer) const = 0;
+  // The number of bytes writeTo() appends.
+  virtual size_t encodedSize() const = 0;
+
+  // False unless `other` is of exactly this message's class.
+  virtual bool isEqual(const PBCodable* other) const = 0;
+  // Equal messages hash alike.
+  virtual uint64_t hash() const = 0;
+  virtual Value dictionaryRepresentation() const = 0;
+  // The base description ("<Class: 0x...>"), a space, and the dictionary.
+  virtual std::string description() const;
+
+  // The type-erased forms of copy() and mergeFrom(), which work on a parent's
+  // sub-message field without knowing its class. The source of a merge must
+  // be of this message's class.
+  virtual std::shared_ptr<PBCodable> copyMessage() const = 0;
+  virtual void mergeFromMessage(const PBCodable& source) = 0;
+
+  // The encoded message in a new buffer.
+  std::vector<uint8_t> data() const;
+
+ protected:
+  std::string baseDescription() const;
+};
+
+}  // namespace kolvrand

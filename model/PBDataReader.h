@@ -1,0 +1,106 @@
+// A cursor over one encoded message: the bytes, the read position, the limit at
+// which the current (sub-)message ends, and a sticky error flag. The read
+// functions of the messages work on this state directly.
+//
+// Invariant kept by every operation: position() <= limit() <= length(), so
+// remaining() never wraps and no read touches a byte at or past the limit.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+
+#include "model/Wire.h"
+
+namespace kolvrand {
+
+// The limit that was in force before a length-delimited run was entered.
+struct PBDataReaderMark {
+  size_t limit = 0;
+};
+
+class PBDataReader {
+ public:
+  // Reads the `length` bytes at `data`, which must stay valid while the reader
+  // is used. A null `data` reads as empty.
+  PBDataReader(const uint8_t* data, size_t length) noexcept
+      : bytes_(data), limit_(data ? length : 0), length_(data ? length : 0) {}
+
+  const uint8_t* bytes() const { return bytes_; }
+  size_t length() const { return length_; }
+  size_t position() const { return pos_; }
+  size_t limit() const { return limit_; }
+  size_t remaining() const { return limit_ - pos_; }
+  bool isAtEnd() const { return pos_ >= limit_; }
+  bool hasError() const { return error_; }
+  void setError() { error_ = true; }
+
+  const uint8_t* cursor() const { return bytes_ + pos_; }
+  // Requires n <= remaining().
+  void advance(size_t n) { pos_ += n; }
+
+  // A base-128 varint, least significant group first, at most 10 bytes.
+  // Running into the limit sets the error flag and yields 0. A 10th byte that
+  // still has its top bit set yields 0 without an error; the 10 bytes are
+  // consumed.
+  uint64_t readVarint() {
+    if (pos_ < limit_ && bytes_[pos_] < 0x80) return bytes_[pos_++];
+    if (remaining() >= wire::kMaxVarintSize) return readVarintUnchecked();
+    return readVarintChecked();
+  }
+
+  // Four little-endian bytes as an IEEE single. With fewer than four bytes
+  // before the limit: sets the error flag, yields 0.0, does not move.
+  float readFloat() {
+    if (remaining() < 4) {
+      error_ = true;
+      return 0.0f;
+    }
+    const float value = wire::loadFloat(cursor());
+    pos_ += 4;
+    return value;
+  }
+
+ private:
+  // Requires remaining() >= 10.
+  uint64_t readVarintUnchecked();
+  uint64_t readVarintChecked();
+
+  friend bool PBReaderPlaceMark(PBDataReader& reader, PBDataReaderMark& mark);
+  friend void PBReaderRecallMark(PBDataReader& reader, const PBDataReaderMark& mark);
+
+  const uint8_t* bytes_;
+  size_t pos_ = 0;
+  size_t limit_;
+  size_t length_;
+  bool error_ = false;
+};
+
+// Reads a length varint and narrows the limit to the run of that many bytes
+// that follows it, saving the old limit in `mark`. Fails (returns false, limit
+// unchanged) when the length is cut short by the limit (error flag set) or when
+// the run would reach past the limit. An over-long length varint reads as 0, as
+// every varint does.
+inline bool PBReaderPlaceMark(PBDataReader& reader, PBDataReaderMark& mark) {
+  const uint64_t length = reader.readVarint();
+  if (reader.error_ || length > reader.remaining()) return false;
+  mark.limit = reader.limit_;
+  reader.limit_ = reader.pos_ + static_cast<size_t>(length);
+  return true;
+}
+
+// Restores the limit saved by PBReaderPlaceMark on the same reader. The
+// position stays where the run's reading left it.
+inline void PBReaderRecallMark(PBDataReader& reader, const PBDataReaderMark& mark) {
+  reader.limit_ = mark.limit;
+}
+
+inline constexpr size_t kMaxGroupDepth = 64;
+
+// Skips one value of `wireType` (varint, fixed64, length-delimited, a whole
+// group up to its matching end tag, or fixed32) for field `fieldNumber`.
+// Returns false for wire types 6 and 7, an end-group tag with no group open or
+// for another field, groups nested more than kMaxGroupDepth deep, and data cut
+// short by the limit (which also sets the error flag).
+bool PBReaderSkipValueWithTag(PBDataReader& reader, uint32_t fieldNumber, uint8_t wireType);
+
+}  // namespace kolvrand
