@@ -73,6 +73,13 @@ concept Describable = requires(const T& t) {
   { t.description() } -> std::convertible_to<std::string>;
 };
 
+// A smart pointer to a describable object (a nil one prints "(null)").
+template <typename T>
+concept DescribablePointer = requires(const T& p) {
+  p.get();
+  { p->description() } -> std::convertible_to<std::string>;
+};
+
 template <typename T>
 LogArg makeLogArg(const T& a) {
   using U = std::remove_cvref_t<T>;
@@ -98,8 +105,7 @@ LogArg makeLogArg(const T& a) {
     return {LogArg::Object{a}};
   } else if constexpr (Describable<U>) {
     return {LogArg::Object{std::string(a.description())}};
-  } else if constexpr (requires { a.get(); } && Describable<std::remove_cvref_t<decltype(*a)>>) {
-    // shared_ptr / unique_ptr to an object: nil prints "(null)"
+  } else if constexpr (DescribablePointer<U>) {
     return a ? LogArg{LogArg::Object{std::string(a->description())}} : LogArg{LogArg::Object{}};
   } else if constexpr (std::is_pointer_v<U>) {
     return {static_cast<const void*>(a)};

@@ -1,0 +1,53 @@
+#include "platform/Backend.h"
+
+#include <cstdlib>
+#include <mutex>
+#include <vector>
+
+#include "platform/Internal.h"
+
+namespace kolvrand::platform {
+
+namespace {
+
+struct Slot {
+  std::mutex mutex;
+  std::shared_ptr<Backend> current;
+  // backend() hands out references; a replaced backend stays alive so that a
+  // thread still holding one never sees it destroyed.
+  std::vector<std::shared_ptr<Backend>> retired;
+};
+
+Slot& slot() {
+  static auto* s = new Slot;
+  return *s;
+}
+
+std::shared_ptr<Backend> chooseBackend() {
+  const char* device = std::getenv("KOLVRAND_DEVICE");
+  if (device && *device) {
+    std::error_code ec;
+    if (std::filesystem::is_directory(device, ec)) return makeSimulatedDevice(device);
+    os_log_error(platformLog("platform"), "KOLVRAND_DEVICE %s is not a directory; using the host\n",
+                 device);
+  }
+  return makeHostBackend();
+}
+
+}  // namespace
+
+Backend& backend() {
+  Slot& s = slot();
+  std::lock_guard lock(s.mutex);
+  if (!s.current) s.current = chooseBackend();
+  return *s.current;
+}
+
+void setBackend(std::shared_ptr<Backend> b) {
+  Slot& s = slot();
+  std::lock_guard lock(s.mutex);
+  if (s.current) s.retired.push_back(std::move(s.current));
+  s.current = std::move(b);
+}
+
+}  // namespace kolvrand::platform

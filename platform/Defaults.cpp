@@ -1,0 +1,225 @@
+#include "platform/Defaults.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <map>
+#include <mutex>
+
+#include "platform/Backend.h"
+#include "platform/Internal.h"
+#include "platform/ValueJSON.h"
+
+namespace kolvrand {
+
+using platform::JSON;
+
+struct NSUserDefaults::Suite {
+  std::filesystem::path path;      // STATE/SUITE.json
+  std::filesystem::path lockPath;  // STATE/SUITE.json.lock
+  std::mutex mutex;                // orders this process's reads and writes
+};
+
+namespace {
+
+const os_log_t& defaultsLog() {
+  return platform::platformLog("defaults");
+}
+
+// flock(2) on the suite's lock file. The data file itself is replaced by
+// rename at every write, so it cannot carry the lock.
+class FileLock {
+ public:
+  FileLock(const std::filesystem::path& path, int operation) {
+    fd_ = ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+    if (fd_ < 0) {
+      error_ = errno;
+      return;
+    }
+    while (::flock(fd_, operation) != 0) {
+      if (errno == EINTR) continue;
+      error_ = errno;
+      ::close(fd_);
+      fd_ = -1;
+      return;
+    }
+  }
+  ~FileLock() {
+    if (fd_ >= 0) ::close(fd_);  // releases the lock
+  }
+  FileLock(const FileLock&) = delete;
+  FileLock& operator=(const FileLock&) = delete;
+
+  bool locked() const { return fd_ >= 0; }
+  int error() const { return error_; }
+
+ private:
+  int fd_ = -1;
+  int error_ = 0;
+};
+
+// The suite's content; missing, unreadable or malformed files read as empty
+// (the latter two logged), and the next write replaces them.
+JSON readSuite(const std::filesystem::path& path) {
+  int err = 0;
+  auto text = platform::readFile(path, &err);
+  if (!text) {
+    if (err != ENOENT)
+      os_log_error(defaultsLog(), "cannot read %s: %s\n", path.string(), std::strerror(err));
+    return JSON::object();
+  }
+  JSON j = JSON::parse(*text, nullptr, false);
+  if (j.is_discarded() || !j.is_object()) {
+    os_log_error(defaultsLog(), "%s is not a JSON object; reading it as empty\n", path.string());
+    return JSON::object();
+  }
+  return j;
+}
+
+bool validSuiteName(std::string_view s) {
+  return !s.empty() && s != "." && s != ".." && s.find('/') == std::string_view::npos &&
+         s.find('\0') == std::string_view::npos;
+}
+
+struct SuiteTable {
+  std::mutex mutex;
+  std::map<std::string, std::weak_ptr<NSUserDefaults::Suite>> suites;
+};
+
+SuiteTable& suiteTable() {
+  static auto* t = new SuiteTable;
+  return *t;
+}
+
+}  // namespace
+
+std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(std::string_view suite) {
+  return initWithSuiteName(suite, platform::backend().stateDirectory());
+}
+
+std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(
+    std::string_view suite, const std::filesystem::path& dir) {
+  if (!validSuiteName(suite)) {
+    os_log_error(defaultsLog(), "invalid defaults suite name \"%s\"\n", suite);
+    return nullptr;
+  }
+  std::error_code ec;
+  std::filesystem::create_directories(dir, ec);
+  int fd = ::open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (fd < 0) {
+    int err = errno;
+    os_log_error(defaultsLog(), "cannot use state directory %s: %s\n", dir.string(),
+                 ec ? ec.message() : std::string(std::strerror(err)));
+    return nullptr;
+  }
+  ::close(fd);
+
+  std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
+  if (ec) absolute = dir;
+  std::filesystem::path path = (absolute / (std::string(suite) + ".json")).lexically_normal();
+
+  SuiteTable& table = suiteTable();
+  std::lock_guard lock(table.mutex);
+  std::shared_ptr<Suite> shared = table.suites[path.string()].lock();
+  if (!shared) {
+    shared = std::make_shared<Suite>();
+    shared->path = path;
+    shared->lockPath = path.string() + ".lock";
+    table.suites[path.string()] = shared;
+  }
+  return std::make_shared<NSUserDefaults>(std::move(shared));
+}
+
+namespace {
+
+// The current content under a shared lock, so a read never overlaps another
+// process's read-modify-write. Without a lock file (read-only directory) the
+// file is read as is; renames keep it whole either way.
+JSON load(NSUserDefaults::Suite& s) {
+  std::lock_guard lock(s.mutex);
+  FileLock fileLock(s.lockPath, LOCK_SH);
+  return readSuite(s.path);
+}
+
+// Read-modify-write under the exclusive lock, so that writers in other
+// processes never lose each other's keys.
+template <typename F>
+bool update(NSUserDefaults::Suite& s, std::string_view key, F&& modify) {
+  std::lock_guard lock(s.mutex);
+  FileLock fileLock(s.lockPath, LOCK_EX);
+  if (!fileLock.locked()) {
+    os_log_error(defaultsLog(), "cannot lock %s: %s; %s not written\n", s.lockPath.string(),
+                 std::strerror(fileLock.error()), key);
+    return false;
+  }
+  JSON content = readSuite(s.path);
+  modify(content);
+  std::string error;
+  if (!platform::writeFileAtomically(
+          s.path, content.dump(2, ' ', false, JSON::error_handler_t::replace) + "\n", &error)) {
+    os_log_error(defaultsLog(), "%s; %s not written\n", error, key);
+    return false;
+  }
+  return true;
+}
+
+const JSON* find(const JSON& content, std::string_view key) {
+  auto it = content.find(std::string(key));
+  return it == content.end() ? nullptr : &*it;
+}
+
+}  // namespace
+
+std::optional<std::string> NSUserDefaults::stringForKey(std::string_view key) const {
+  JSON content = load(*suite_);
+  const JSON* v = find(content, key);
+  if (!v || !v->is_string()) return std::nullopt;
+  return v->get<std::string>();
+}
+
+int64_t NSUserDefaults::integerForKey(std::string_view key) const {
+  JSON content = load(*suite_);
+  const JSON* v = find(content, key);
+  if (!v || !v->is_number_integer()) return 0;
+  if (v->is_number_unsigned()) {
+    uint64_t u = v->get<uint64_t>();
+    return u > static_cast<uint64_t>(INT64_MAX) ? 0 : static_cast<int64_t>(u);
+  }
+  return v->get<int64_t>();
+}
+
+bool NSUserDefaults::boolForKey(std::string_view key) const {
+  JSON content = load(*suite_);
+  const JSON* v = find(content, key);
+  return v && v->is_boolean() && v->get<bool>();
+}
+
+bool NSUserDefaults::objectForKeyExists(std::string_view key) const {
+  JSON content = load(*suite_);
+  return find(content, key) != nullptr;
+}
+
+bool NSUserDefaults::setObject(std::string_view value, std::string_view key) {
+  return update(*suite_, key, [&](JSON& c) { c[std::string(key)] = std::string(value); });
+}
+
+bool NSUserDefaults::setInteger(int64_t value, std::string_view key) {
+  return update(*suite_, key, [&](JSON& c) { c[std::string(key)] = value; });
+}
+
+bool NSUserDefaults::setBool(bool value, std::string_view key) {
+  return update(*suite_, key, [&](JSON& c) { c[std::string(key)] = value; });
+}
+
+bool NSUserDefaults::removeObjectForKey(std::string_view key) {
+  return update(*suite_, key, [&](JSON& c) { c.erase(std::string(key)); });
+}
+
+const std::filesystem::path& NSUserDefaults::path() const {
+  return suite_->path;
+}
+
+}  // namespace kolvrand

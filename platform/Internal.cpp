@@ -1,0 +1,139 @@
+#include "platform/Internal.h"
+
+#include <fcntl.h>
+#include <stdlib.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <map>
+#include <mutex>
+
+namespace kolvrand::platform {
+
+namespace {
+
+// close(2) that keeps errno of the failure being reported.
+void closeQuietly(int fd) {
+  int saved = errno;
+  ::close(fd);
+  errno = saved;
+}
+
+bool writeAll(int fd, const char* p, size_t n) {
+  while (n > 0) {
+    ssize_t w = ::write(fd, p, n);
+    if (w < 0) {
+      if (errno == EINTR) continue;
+      return false;
+    }
+    p += w;
+    n -= static_cast<size_t>(w);
+  }
+  return true;
+}
+
+}  // namespace
+
+const os_log_t& platformLog(std::string_view category) {
+  // Never destroyed: platform code logs from static destructors and at exit.
+  static auto* mutex = new std::mutex;
+  static auto* logs = new std::map<std::string, os_log_t, std::less<>>;
+  std::lock_guard lock(*mutex);
+  auto it = logs->find(category);
+  if (it == logs->end()) {
+    std::string name(category);
+    it = logs->emplace(name, os_log_create(kPlatformSubsystem, name.c_str())).first;
+  }
+  return it->second;
+}
+
+std::optional<std::string> readFile(const std::filesystem::path& path, int* err) {
+  int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  if (fd < 0) {
+    if (err) *err = errno;
+    return std::nullopt;
+  }
+  std::string out;
+  char buf[8192];
+  for (;;) {
+    ssize_t n = ::read(fd, buf, sizeof buf);
+    if (n < 0) {
+      if (errno == EINTR) continue;
+      if (err) *err = errno;
+      closeQuietly(fd);
+      return std::nullopt;
+    }
+    if (n == 0) break;
+    out.append(buf, static_cast<size_t>(n));
+  }
+  ::close(fd);
+  return out;
+}
+
+bool writeFileAtomically(const std::filesystem::path& path, std::string_view bytes,
+                         std::string* error) {
+  auto fail = [&](const char* what, const std::string& tmp) {
+    if (error)
+      *error = std::string(what) + " " + (tmp.empty() ? path.string() : tmp) + ": " +
+               std::strerror(errno);
+    if (!tmp.empty()) ::unlink(tmp.c_str());
+    return false;
+  };
+  std::filesystem::path dir = path.parent_path();
+  if (dir.empty()) dir = ".";
+  std::string tmp = path.string() + ".XXXXXX";
+  int fd = ::mkostemp(tmp.data(), O_CLOEXEC);
+  if (fd < 0) return fail("cannot create a temporary file for", "");
+  if (!writeAll(fd, bytes.data(), bytes.size())) {
+    closeQuietly(fd);
+    return fail("cannot write", tmp);
+  }
+  if (::fsync(fd) != 0) {
+    closeQuietly(fd);
+    return fail("cannot sync", tmp);
+  }
+  if (::close(fd) != 0) return fail("cannot close", tmp);
+  if (::rename(tmp.c_str(), path.c_str()) != 0) return fail("cannot rename", tmp);
+  // The rename itself is durable only once the directory is synced.
+  int dfd = ::open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (dfd < 0) return fail("cannot open directory of", "");
+  if (::fsync(dfd) != 0) {
+    closeQuietly(dfd);
+    return fail("cannot sync directory of", "");
+  }
+  ::close(dfd);
+  return true;
+}
+
+std::string toHex(const void* data, size_t len) {
+  static const char* digits = "0123456789abcdef";
+  const auto* p = static_cast<const unsigned char*>(data);
+  std::string out;
+  out.reserve(len * 2);
+  for (size_t i = 0; i < len; ++i) {
+    out += digits[p[i] >> 4];
+    out += digits[p[i] & 15];
+  }
+  return out;
+}
+
+std::optional<std::string> fromHex(std::string_view hex) {
+  auto nibble = [](char c) -> int {
+    if (c >= '0' && c <= '9') return c - '0';
+    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
+    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
+    return -1;
+  };
+  if (hex.size() % 2 != 0) return std::nullopt;
+  std::string out;
+  out.reserve(hex.size() / 2);
+  for (size_t i = 0; i < hex.size(); i += 2) {
+    int hi = nibble(hex[i]), lo = nibble(hex[i + 1]);
+    if (hi < 0 || lo < 0) return std::nullopt;
+    out += static_cast<char>(hi << 4 | lo);
+  }
+  return out;
+}
+
+}  // namespace kolvrand::platform

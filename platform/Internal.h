@@ -1,0 +1,33 @@
+// Helpers shared by the platform sources; not part of the platform's interface.
+#pragma once
+
+#include <filesystem>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/Log.h"
+
+namespace kolvrand::platform {
+
+// The log subsystem of the platform layer's own messages.
+inline constexpr const char* kPlatformSubsystem = "com.tesvar.kolvrand";
+
+// A log of the platform layer, created once per category.
+const os_log_t& platformLog(std::string_view category);
+
+// The whole file, read with read(2) so that /proc and sysfs files (which
+// report a size of 0) work; nullopt with *err set to errno on failure.
+std::optional<std::string> readFile(const std::filesystem::path& path, int* err = nullptr);
+
+// Replaces `path` with `bytes` so that a reader sees either the old or the new
+// content and the new content survives a crash once this returns true:
+// temporary file in the same directory, fsync, rename, fsync of the directory.
+bool writeFileAtomically(const std::filesystem::path& path, std::string_view bytes,
+                         std::string* error);
+
+std::string toHex(const void* data, size_t len);
+// Even-length hexadecimal text of either case; nullopt on anything else.
+std::optional<std::string> fromHex(std::string_view hex);
+
+}  // namespace kolvrand::platform

@@ -1,0 +1,550 @@
+#include "platform/Log.h"
+
+#include <sys/stat.h>
+#include <sys/uio.h>
+#include <unistd.h>
+#define SD_JOURNAL_SUPPRESS_LOCATION
+#include <systemd/sd-journal.h>
+
+#include <cerrno>
+#include <cinttypes>
+#include <cmath>
+#include <cstdio>
+#include <cstdlib>
+#include <limits>
+#include <map>
+#include <mutex>
+
+namespace kolvrand {
+
+namespace {
+
+// ---- Which levels are enabled -------------------------------------------
+
+struct LevelConfig {
+  LogLevel fallback = LogLevel::Default;
+  std::map<std::string, LogLevel, std::less<>> categories;
+};
+
+struct LevelState {
+  std::mutex mutex;
+  LevelConfig config;
+  bool configured = false;  // set by setLogLevelSpec or the first os_log_create
+};
+
+// Never destroyed: logging stays usable while other statics are torn down.
+LevelState& levelState() {
+  static auto* s = new LevelState;
+  return *s;
+}
+
+std::string_view trim(std::string_view s) {
+  while (!s.empty() && (s.front() == ' ' || s.front() == '\t')) s.remove_prefix(1);
+  while (!s.empty() && (s.back() == ' ' || s.back() == '\t')) s.remove_suffix(1);
+  return s;
+}
+
+std::optional<LogLevel> parseLevel(std::string_view s) {
+  std::string lower;
+  for (char c : s) lower += static_cast<char>(c >= 'A' && c <= 'Z' ? c - 'A' + 'a' : c);
+  if (lower == "error") return LogLevel::Error;
+  if (lower == "default") return LogLevel::Default;
+  if (lower == "debug") return LogLevel::Debug;
+  return std::nullopt;
+}
+
+// Items apply in order: a bare level sets every category (earlier
+// per-category items included), CATEGORY=LEVEL sets one.
+LevelConfig parseLevelSpec(std::string_view spec) {
+  LevelConfig config;
+  while (!spec.empty()) {
+    size_t comma = spec.find(',');
+    std::string_view item = trim(spec.substr(0, comma));
+    spec = comma == std::string_view::npos ? std::string_view() : spec.substr(comma + 1);
+    size_t eq = item.find('=');
+    if (eq == std::string_view::npos) {
+      if (auto level = parseLevel(item)) {
+        config.fallback = *level;
+        config.categories.clear();
+      }
+      continue;
+    }
+    std::string_view category = trim(item.substr(0, eq));
+    auto level = parseLevel(trim(item.substr(eq + 1)));
+    if (!category.empty() && level) config.categories[std::string(category)] = *level;
+  }
+  return config;
+}
+
+// ---- Sinks ----------------------------------------------------------------
+
+const char* levelName(LogLevel level) {
+  switch (level) {
+    case LogLevel::Error:
+      return "error";
+    case LogLevel::Default:
+      return "default";
+    case LogLevel::Debug:
+      return "debug";
+  }
+  return "default";
+}
+
+std::string_view withoutTrailingNewline(std::string_view message) {
+  if (!message.empty() && message.back() == '\n') message.remove_suffix(1);
+  return message;
+}
+
+void writeStderrLine(LogLevel level, std::string_view category, std::string_view message) {
+  // One write per line under a process-wide mutex: lines of different threads
+  // never interleave, and a line is never split by another process's output
+  // as long as it fits in a pipe buffer.
+  static auto* mutex = new std::mutex;
+  std::string line = "kolvrand[" + std::to_string(::getpid()) + "]: " + levelName(level) + " [";
+  line.append(category);
+  line += "] ";
+  size_t start = line.size();
+  line.append(withoutTrailingNewline(message));
+  // Keep one message on one line so that the output stays line-oriented.
+  for (size_t i = start; i < line.size(); ++i)
+    if (line[i] == '\n') line[i] = ' ';
+  line += '\n';
+  std::lock_guard lock(*mutex);
+  const char* p = line.data();
+  size_t left = line.size();
+  while (left > 0) {
+    ssize_t n = ::write(STDERR_FILENO, p, left);
+    if (n < 0) {
+      if (errno == EINTR) continue;
+      return;
+    }
+    p += n;
+    left -= static_cast<size_t>(n);
+  }
+}
+
+class StderrSink final : public LogSink {
+ public:
+  void write(LogLevel level, std::string_view, std::string_view category,
+             std::string_view message) override {
+    writeStderrLine(level, category, message);
+  }
+};
+
+class JournalSink final : public LogSink {
+ public:
+  void write(LogLevel level, std::string_view subsystem, std::string_view category,
+             std::string_view message) override {
+    const char* priority = level == LogLevel::Error     ? "PRIORITY=3"
+                           : level == LogLevel::Default ? "PRIORITY=5"
+                                                        : "PRIORITY=7";
+    std::string sub = "KOLVRAND_SUBSYSTEM=";
+    sub.append(subsystem);
+    std::string cat = "KOLVRAND_CATEGORY=";
+    cat.append(category);
+    std::string msg = "MESSAGE=";
+    msg.append(withoutTrailingNewline(message));
+    static const char identifier[] = "SYSLOG_IDENTIFIER=kolvrand";
+    auto iov = [](const void* p, size_t n) { return iovec{const_cast<void*>(p), n}; };
+    const iovec fields[] = {
+        iov(priority, std::char_traits<char>::length(priority)),
+        iov(identifier, sizeof identifier - 1),
+        iov(sub.data(), sub.size()),
+        iov(cat.data(), cat.size()),
+        iov(msg.data(), msg.size()),
+    };
+    if (sd_journal_sendv(fields, static_cast<int>(std::size(fields))) < 0)
+      writeStderrLine(level, category, message);
+  }
+};
+
+// systemd sets JOURNAL_STREAM to the device and inode of the stream it
+// connected stdout/stderr to; if fd 2 is still that stream, the journal gets
+// structured entries rather than bare lines.
+bool stderrIsJournal() {
+  const char* env = std::getenv("JOURNAL_STREAM");
+  if (!env) return false;
+  uintmax_t dev = 0, ino = 0;
+  char extra = 0;
+  if (std::sscanf(env, "%ju:%ju%c", &dev, &ino, &extra) != 2) return false;
+  struct stat st {};
+  if (::fstat(STDERR_FILENO, &st) != 0) return false;
+  return static_cast<uintmax_t>(st.st_dev) == dev && static_cast<uintmax_t>(st.st_ino) == ino;
+}
+
+struct SinkState {
+  std::mutex mutex;
+  std::shared_ptr<LogSink> installed;
+  std::shared_ptr<LogSink> standard;  // chosen once, at first use
+};
+
+SinkState& sinkState() {
+  static auto* s = new SinkState;
+  return *s;
+}
+
+std::shared_ptr<LogSink> currentSink() {
+  SinkState& s = sinkState();
+  std::lock_guard lock(s.mutex);
+  if (s.installed) return s.installed;
+  if (!s.standard) {
+    if (stderrIsJournal())
+      s.standard = std::make_shared<JournalSink>();
+    else
+      s.standard = std::make_shared<StderrSink>();
+  }
+  return s.standard;
+}
+
+// ---- Formatting -----------------------------------------------------------
+
+enum class Length { None, hh, h, l, ll, j, z, t, L };
+
+// Widths and precisions beyond this are clamped so a bad format cannot make
+// a single message allocate without bound.
+constexpr int kMaxField = 4096;
+
+// The argument's bits as an integer, the way a C vararg would be read.
+uint64_t integerBits(const LogArg& a) {
+  struct V {
+    uint64_t operator()(int64_t v) const { return static_cast<uint64_t>(v); }
+    uint64_t operator()(uint64_t v) const { return v; }
+    uint64_t operator()(double v) const {
+      if (std::isnan(v)) return 0;
+      if (v <= -9.2233720368547758e18) return static_cast<uint64_t>(INT64_MIN);
+      if (v >= 1.8446744073709552e19) return UINT64_MAX;
+      if (v < 0) return static_cast<uint64_t>(static_cast<int64_t>(v));
+      return static_cast<uint64_t>(v);
+    }
+    uint64_t operator()(const void* p) const { return reinterpret_cast<uintptr_t>(p); }
+    uint64_t operator()(const char* p) const { return reinterpret_cast<uintptr_t>(p); }
+    uint64_t operator()(std::string_view) const { return 0; }
+    uint64_t operator()(const LogArg::Object&) const { return 0; }
+  };
+  return std::visit(V{}, a.v);
+}
+
+double floatingValue(const LogArg& a) {
+  if (auto* d = std::get_if<double>(&a.v)) return *d;
+  if (auto* s = std::get_if<int64_t>(&a.v)) return static_cast<double>(*s);
+  if (auto* u = std::get_if<uint64_t>(&a.v)) return static_cast<double>(*u);
+  return 0;
+}
+
+// Text for %s and %@.
+std::string textValue(const LogArg& a) {
+  struct V {
+    std::string operator()(int64_t v) const { return std::to_string(v); }
+    std::string operator()(uint64_t v) const { return std::to_string(v); }
+    std::string operator()(double v) const {
+      char buf[64];
+      std::snprintf(buf, sizeof buf, "%g", v);
+      return buf;
+    }
+    std::string operator()(const void* p) const {
+      if (!p) return "(null)";
+      char buf[32];
+      std::snprintf(buf, sizeof buf, "%p", p);
+      return buf;
+    }
+    std::string operator()(const char* p) const { return p ? p : "(null)"; }
+    std::string operator()(std::string_view s) const { return std::string(s); }
+    std::string operator()(const LogArg::Object& o) const { return o.text ? *o.text : "(null)"; }
+  };
+  return std::visit(V{}, a.v);
+}
+
+template <typename T>
+void appendPrintf(std::string& out, const std::string& fmt, T value) {
+  char buf[256];
+  int n = std::snprintf(buf, sizeof buf, fmt.c_str(), value);
+  if (n < 0) return;
+  if (static_cast<size_t>(n) < sizeof buf) {
+    out.append(buf, static_cast<size_t>(n));
+    return;
+  }
+  std::string big(static_cast<size_t>(n) + 1, '\0');
+  std::snprintf(big.data(), big.size(), fmt.c_str(), value);
+  out.append(big.data(), static_cast<size_t>(n));
+}
+
+struct Directive {
+  std::string flags;
+  int width = -1;
+  int precision = -1;
+  Length length = Length::None;
+  char conversion = 0;
+
+  // A printf directive with only the flags that are defined for the
+  // conversion, so snprintf never sees an undefined combination.
+  std::string printfFormat(std::string_view allowedFlags, std::string_view lengthModifier,
+                           char conv, bool withPrecision = true) const {
+    std::string f = "%";
+    for (char c : flags)
+      if (allowedFlags.find(c) != std::string_view::npos) f += c;
+    if (width >= 0) f += std::to_string(width);
+    if (withPrecision && precision >= 0) f += "." + std::to_string(precision);
+    f.append(lengthModifier);
+    f += conv;
+    return f;
+  }
+};
+
+long long asSigned(uint64_t bits, Length length) {
+  switch (length) {
+    case Length::hh:
+      return static_cast<signed char>(bits);
+    case Length::h:
+      return static_cast<short>(bits);
+    case Length::None:
+      return static_cast<int>(bits);
+    case Length::l:
+      return static_cast<long>(bits);
+    case Length::ll:
+      return static_cast<long long>(bits);
+    case Length::j:
+      return static_cast<intmax_t>(bits);
+    case Length::z:
+      return static_cast<ssize_t>(bits);
+    case Length::t:
+      return static_cast<ptrdiff_t>(bits);
+    case Length::L:
+      return static_cast<long long>(bits);
+  }
+  return static_cast<int>(bits);
+}
+
+unsigned long long asUnsigned(uint64_t bits, Length length) {
+  switch (length) {
+    case Length::hh:
+      return static_cast<unsigned char>(bits);
+    case Length::h:
+      return static_cast<unsigned short>(bits);
+    case Length::None:
+      return static_cast<unsigned int>(bits);
+    case Length::l:
+      return static_cast<unsigned long>(bits);
+    case Length::ll:
+      return static_cast<unsigned long long>(bits);
+    case Length::j:
+      return static_cast<uintmax_t>(bits);
+    case Length::z:
+      return static_cast<size_t>(bits);
+    case Length::t:
+      return static_cast<size_t>(bits);
+    case Length::L:
+      return static_cast<unsigned long long>(bits);
+  }
+  return static_cast<unsigned int>(bits);
+}
+
+void appendPadded(std::string& out, std::string text, const Directive& d) {
+  if (d.precision >= 0 && text.size() > static_cast<size_t>(d.precision)) text.resize(d.precision);
+  size_t pad =
+      d.width > 0 && text.size() < static_cast<size_t>(d.width) ? d.width - text.size() : 0;
+  bool left = d.flags.find('-') != std::string::npos;
+  if (!left) out.append(pad, ' ');
+  out += text;
+  if (left) out.append(pad, ' ');
+}
+
+int parseNumber(std::string_view format, size_t& i) {
+  long n = 0;
+  while (i < format.size() && format[i] >= '0' && format[i] <= '9') {
+    n = n * 10 + (format[i] - '0');
+    if (n > kMaxField) n = kMaxField;
+    ++i;
+  }
+  return static_cast<int>(n);
+}
+
+}  // namespace
+
+void setLogSink(std::shared_ptr<LogSink> sink) {
+  SinkState& s = sinkState();
+  std::lock_guard lock(s.mutex);
+  s.installed = std::move(sink);
+}
+
+void setLogLevelSpec(std::string_view spec) {
+  LevelState& s = levelState();
+  LevelConfig config = parseLevelSpec(spec);
+  std::lock_guard lock(s.mutex);
+  s.config = std::move(config);
+  s.configured = true;
+}
+
+bool OSLog::enabled(LogLevel level) const {
+  LevelState& s = levelState();
+  std::lock_guard lock(s.mutex);
+  auto it = s.config.categories.find(category_);
+  LogLevel max = it != s.config.categories.end() ? it->second : s.config.fallback;
+  return static_cast<uint8_t>(level) <= static_cast<uint8_t>(max);
+}
+
+os_log_t os_log_create(const char* subsystem, const char* category) {
+  LevelState& s = levelState();
+  {
+    std::lock_guard lock(s.mutex);
+    if (!s.configured) {
+      s.configured = true;
+      if (const char* env = std::getenv("KOLVRAND_LOG_LEVEL")) s.config = parseLevelSpec(env);
+    }
+  }
+  return std::make_shared<const OSLog>(subsystem ? subsystem : "", category ? category : "");
+}
+
+std::string formatLogMessage(std::string_view format, std::span<const LogArg> args) {
+  std::string out;
+  out.reserve(format.size() + 32);
+  size_t next = 0;  // index of the next unused argument
+  auto take = [&]() -> const LogArg* { return next < args.size() ? &args[next++] : nullptr; };
+
+  for (size_t i = 0; i < format.size();) {
+    char c = format[i];
+    if (c != '%') {
+      size_t end = format.find('%', i);
+      if (end == std::string_view::npos) end = format.size();
+      out.append(format.substr(i, end - i));
+      i = end;
+      continue;
+    }
+    size_t start = i++;
+    // Privacy annotations such as %{public}s carry no meaning here.
+    if (i < format.size() && format[i] == '{') {
+      size_t close = format.find('}', i);
+      if (close != std::string_view::npos) i = close + 1;
+    }
+    Directive d;
+    while (i < format.size() && std::string_view("-+ #0").find(format[i]) != std::string_view::npos)
+      d.flags += format[i++];
+    if (i < format.size() && format[i] == '*') {
+      ++i;
+      if (const LogArg* a = take()) {
+        long long w = static_cast<int>(integerBits(*a));
+        if (w < 0) {
+          d.flags += '-';
+          w = -w;
+        }
+        d.width = static_cast<int>(std::min<long long>(w, kMaxField));
+      }
+    } else if (i < format.size() && format[i] >= '0' && format[i] <= '9') {
+      d.width = parseNumber(format, i);
+    }
+    if (i < format.size() && format[i] == '.') {
+      ++i;
+      if (i < format.size() && format[i] == '*') {
+        ++i;
+        const LogArg* a = take();
+        int p = a ? static_cast<int>(integerBits(*a)) : -1;
+        d.precision = p < 0 ? -1 : std::min(p, kMaxField);
+      } else {
+        d.precision = parseNumber(format, i);
+      }
+    }
+    if (format.substr(i, 2) == "hh") {
+      d.length = Length::hh;
+      i += 2;
+    } else if (format.substr(i, 2) == "ll") {
+      d.length = Length::ll;
+      i += 2;
+    } else if (i < format.size()) {
+      switch (format[i]) {
+        case 'h':
+          d.length = Length::h;
+          ++i;
+          break;
+        case 'l':
+          d.length = Length::l;
+          ++i;
+          break;
+        case 'j':
+          d.length = Length::j;
+          ++i;
+          break;
+        case 'z':
+          d.length = Length::z;
+          ++i;
+          break;
+        case 't':
+          d.length = Length::t;
+          ++i;
+          break;
+        case 'L':
+          d.length = Length::L;
+          ++i;
+          break;
+        case 'q':
+          d.length = Length::ll;
+          ++i;
+          break;
+        default:
+          break;
+      }
+    }
+    if (i >= format.size()) {  // a directive cut off by the end of the format
+      out.append(format.substr(start));
+      break;
+    }
+    d.conversion = format[i++];
+
+    switch (d.conversion) {
+      case '%':
+        out += '%';
+        break;
+      case 'd':
+      case 'i':
+        if (const LogArg* a = take())
+          appendPrintf(out, d.printfFormat("-+ 0", "ll", 'd'), asSigned(integerBits(*a), d.length));
+        break;
+      case 'u':
+      case 'x':
+      case 'X':
+      case 'o':
+        if (const LogArg* a = take())
+          appendPrintf(out, d.printfFormat("-#0", "ll", d.conversion),
+                       asUnsigned(integerBits(*a), d.length));
+        break;
+      case 'f':
+      case 'F':
+      case 'e':
+      case 'E':
+      case 'g':
+      case 'G':
+      case 'a':
+      case 'A':
+        if (const LogArg* a = take())
+          appendPrintf(out, d.printfFormat("-+ #0", "", d.conversion), floatingValue(*a));
+        break;
+      case 'c':
+        if (const LogArg* a = take())
+          appendPrintf(out, d.printfFormat("-", "", 'c', false),
+                       static_cast<int>(static_cast<unsigned char>(integerBits(*a))));
+        break;
+      case 'p':
+        if (const LogArg* a = take())
+          appendPrintf(out, d.printfFormat("-", "", 'p', false),
+                       reinterpret_cast<const void*>(static_cast<uintptr_t>(integerBits(*a))));
+        break;
+      case 's':
+      case '@':
+        if (const LogArg* a = take()) appendPadded(out, textValue(*a), d);
+        break;
+      case 'n':
+        take();
+        break;  // never writes through an argument
+      default:
+        out.append(format.substr(start, i - start));
+        break;
+    }
+  }
+  return out;
+}
+
+void emitLog(const OSLog& log, LogLevel level, std::string_view format,
+             std::span<const LogArg> args) {
+  std::string message = formatLogMessage(format, args);
+  if (auto sink = currentSink()) sink->write(level, log.subsystem(), log.category(), message);
+}
+
+}  // namespace kolvrand
