@@ -1,0 +1,122 @@
+// The real kolvrand binary run on a simulated device, its stderr in a file.
+#pragma once
+
+#include <fcntl.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <regex>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+extern char** environ;
+
+namespace kolvrand::test {
+
+inline std::filesystem::path daemonBinary() {
+  return std::filesystem::path(KOLVRAND_BINARY_DIR) / "daemon" / "kolvrand";
+}
+
+class DaemonProcess {
+ public:
+  DaemonProcess(const std::filesystem::path& device, const std::string& logLevel = "debug")
+      : stderrPath_(device / "daemon.stderr") {
+    std::vector<std::string> env;
+    for (char** e = environ; *e; ++e) {
+      std::string_view v(*e);
+      if (!v.starts_with("KOLVRAND_") && !v.starts_with("JOURNAL_STREAM=") &&
+          !v.starts_with("STATE_DIRECTORY="))
+        env.emplace_back(v);
+    }
+    env.push_back("KOLVRAND_DEVICE=" + device.string());
+    env.push_back("KOLVRAND_LOG_LEVEL=" + logLevel);
+    std::vector<char*> envp;
+    for (auto& s : env) envp.push_back(s.data());
+    envp.push_back(nullptr);
+
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, 2, stderrPath_.c_str(),
+                                     O_WRONLY | O_CREAT | O_TRUNC, 0644);
+    std::string binary = daemonBinary().string();
+    char* argv[] = {binary.data(), nullptr};
+    running_ = posix_spawn(&pid_, binary.c_str(), &actions, nullptr, argv, envp.data()) == 0;
+    posix_spawn_file_actions_destroy(&actions);
+  }
+  ~DaemonProcess() {
+    if (running_) {
+      kill(pid_, SIGKILL);
+      waitpid(pid_, nullptr, 0);
+    }
+  }
+  DaemonProcess(const DaemonProcess&) = delete;
+  DaemonProcess& operator=(const DaemonProcess&) = delete;
+
+  bool running() const { return running_; }
+  void signal(int sig) const {
+    if (running_) kill(pid_, sig);
+  }
+
+  // Its exit status, or -1 when it did not exit within the timeout.
+  int waitForExit(std::chrono::seconds timeout = std::chrono::seconds(10)) {
+    auto deadline = std::chrono::steady_clock::now() + timeout;
+    while (std::chrono::steady_clock::now() < deadline) {
+      int status = 0;
+      if (running_ && waitpid(pid_, &status, WNOHANG) == pid_) {
+        running_ = false;
+        return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+      }
+      std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    return -1;
+  }
+
+  std::string rawStderr() const {
+    std::ifstream in(stderrPath_);
+    std::stringstream s;
+    s << in.rdbuf();
+    return s.str();
+  }
+
+  // Lines as "LEVEL [category] text"; false when a line lacks the exact
+  // "kolvrand[PID]: " prefix.
+  std::vector<std::string> lines(bool* wellFormed = nullptr) const {
+    std::vector<std::string> out;
+    std::istringstream in(rawStderr());
+    const std::string prefix = "kolvrand[" + std::to_string(pid_) + "]: ";
+    bool ok = true;
+    for (std::string line; std::getline(in, line);) {
+      if (line.starts_with(prefix))
+        out.push_back(line.substr(prefix.size()));
+      else
+        ok = false, out.push_back(line);
+    }
+    if (wellFormed) *wellFormed = ok;
+    return out;
+  }
+
+  // Waits until a line contains `text`.
+  bool waitForLine(const std::string& text,
+                   std::chrono::seconds timeout = std::chrono::seconds(10)) const {
+    auto deadline = std::chrono::steady_clock::now() + timeout;
+    while (std::chrono::steady_clock::now() < deadline) {
+      if (rawStderr().find(text) != std::string::npos) return true;
+      std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    return false;
+  }
+
+ private:
+  std::filesystem::path stderrPath_;
+  pid_t pid_ = -1;
+  bool running_ = false;
+};
+
+}  // namespace kolvrand::test

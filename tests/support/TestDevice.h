@@ -1,0 +1,107 @@
+// A simulated device in a temporary directory, installed as the platform
+// backend for the test's duration, and a log sink that keeps every message.
+#pragma once
+
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <mutex>
+#include <nlohmann/json.hpp>
+#include <string>
+#include <vector>
+
+#include "platform/Backend.h"
+#include "platform/Log.h"
+
+namespace kolvrand::test {
+
+// Keeps messages as "LEVEL [category] text", the text without its line feed.
+class LogCapture : public LogSink {
+ public:
+  LogCapture() = default;
+  void write(LogLevel level, std::string_view, std::string_view category,
+             std::string_view message) override {
+    static const char* names[] = {"error", "default", "debug"};
+    if (!message.empty() && message.back() == '\n') message.remove_suffix(1);
+    std::lock_guard lock(mutex_);
+    lines_.push_back(std::string(names[static_cast<int>(level)]) + " [" + std::string(category) +
+                     "] " + std::string(message));
+  }
+  std::vector<std::string> lines() const {
+    std::lock_guard lock(mutex_);
+    return lines_;
+  }
+  void clear() {
+    std::lock_guard lock(mutex_);
+    lines_.clear();
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::vector<std::string> lines_;
+};
+
+// The device of examples/device, with every field a test may change.
+inline nlohmann::json defaultDeviceJSON() {
+  return {
+      {"sysctl",
+       {{"kern.bootsessionuuid", "11111111-2222-3333-4444-555555555555"},
+        {"hw.targettype", "T618e"}}},
+      {"registry",
+       {{"TesvarSmartBattery",
+         {{"BatteryData", {{"AlgoChemID", 6439}, {"BatterySerialNumber", "F5D2470A1B2C3D4E"}}}}},
+        {"TesvarKVR", nlohmann::json::object()}}},
+      {"driver", {{"openResult", 0}, {"setBatteryParamsResult", 0}}},
+  };
+}
+
+class TestDevice {
+ public:
+  explicit TestDevice(const nlohmann::json& device = defaultDeviceJSON()) {
+    char pattern[] = "/tmp/kolvrand-test.XXXXXX";
+    dir_ = mkdtemp(pattern);
+    writeDeviceJSON(device);
+    capture_ = std::make_shared<LogCapture>();
+    setLogSink(capture_);
+    setLogLevelSpec("debug");
+    reload();
+  }
+  ~TestDevice() {
+    platform::setBackend(nullptr);
+    setLogSink(nullptr);
+    setLogLevelSpec("");
+    std::error_code ec;
+    std::filesystem::remove_all(dir_, ec);
+  }
+  TestDevice(const TestDevice&) = delete;
+  TestDevice& operator=(const TestDevice&) = delete;
+
+  const std::filesystem::path& dir() const { return dir_; }
+  void writeDeviceJSON(const nlohmann::json& device) {
+    std::ofstream(dir_ / "device.json") << device.dump(2);
+  }
+  // Reads device.json again, as a new start of the daemon does.
+  void reload() { platform::setBackend(platform::makeSimulatedDevice(dir_)); }
+
+  // Puts `bytes` at Library/KVR/BatteryModels/RELATIVE.
+  void installModel(const std::string& relative, const std::string& bytes) {
+    auto path = dir_ / "Library/KVR/BatteryModels" / relative;
+    std::filesystem::create_directories(path.parent_path());
+    std::ofstream(path, std::ios::binary) << bytes;
+  }
+  std::filesystem::path statePath() const { return dir_ / "state/com.tesvar.kolvrand.json"; }
+  nlohmann::json state() const {
+    std::ifstream in(statePath());
+    if (!in) return nlohmann::json::object();
+    return nlohmann::json::parse(in, nullptr, false);
+  }
+
+  std::vector<std::string> logLines() const { return capture_->lines(); }
+  void clearLog() { capture_->clear(); }
+
+ private:
+  std::filesystem::path dir_;
+  std::shared_ptr<LogCapture> capture_;
+};
+
+}  // namespace kolvrand::test
