@@ -1,0 +1,240 @@
+// Exact encodings, and decoding of valid, unusual and broken input.
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <memory>
+#include <vector>
+
+#include "model/OTAParamRC.h"
+#include "tests/model/Hex.h"
+
+namespace kolvrand {
+namespace {
+
+using test::decode;
+using test::fromHex;
+using test::toHex;
+
+std::vector<float> list(const float* p, size_t n) {
+  if (!p) return {};
+  return std::vector<float>(p, p + n);
+}
+
+TEST(OTAParamRCWire, WritesExactBytes) {
+  struct Case {
+    const char* name;
+    std::function<void(OTAParamRC&)> build;
+    const char* hex;
+  };
+  const Case cases[] = {
+      {"new message holds field 18 only", [](OTAParamRC&) {}, "90 01 00"},
+      {"chemID and mLBConfig",
+       [](OTAParamRC& m) {
+         m.setChemID(0x1234);
+         m.setMLBConfig(kKVRNorthSouthSplitMLB);
+       },
+       "90 01 B4 24 E8 02 01"},
+      {"negative mLBConfig is a ten-byte varint", [](OTAParamRC& m) { m.setMLBConfig(-1); },
+       "90 01 00 E8 02 FF FF FF FF FF FF FF FF FF 01"},
+      {"field 21 before 23 despite has-bit order",
+       [](OTAParamRC& m) {
+         m.setBaselineWRdc(0.5f);
+         m.setMaxRdcRatio(1.0f);
+       },
+       "90 01 00 AD 01 00 00 80 3F BD 01 00 00 00 3F"},
+      {"empty sub-message is written with length 0",
+       [](OTAParamRC& m) { m.setR0(std::make_shared<OTAResistanceData>()); }, "0A 00 90 01 00"},
+      {"cleared sub-message and has-bits are not written",
+       [](OTAParamRC& m) {
+         m.setR0(std::make_shared<OTAResistanceData>());
+         m.setR0(nullptr);
+         m.setMLBConfig(1);
+         m.setHasMLBConfig(false);
+         m.setMaxRdcRatio(2.0f);
+         m.setHasMaxRdcRatio(false);
+       },
+       "90 01 00"},
+      {"lists unpacked, nested messages length-prefixed",
+       [](OTAParamRC& m) {
+         auto r0 = std::make_shared<OTAResistanceData>();
+         r0->addResistance25C(1.0f);
+         r0->addTemperatureCoeff(2.0f);
+         m.setR0(r0);
+         auto bmu = std::make_shared<OTABMUResistance>();
+         bmu->setDownstreamNorthResistance(1.0f);
+         m.setBmuResistance(bmu);
+         m.addAgingCoeffForR0(1.0f);
+         m.addAgingCoeffForR0(2.0f);
+       },
+       "0A 0A 0D 00 00 80 3F 15 00 00 00 40 4D 00 00 80 3F 4D 00 00 00 40 "
+       "8A 01 05 2D 00 00 80 3F 90 01 00"},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    OTAParamRC m;
+    c.build(m);
+    EXPECT_EQ(toHex(m.data()), c.hex);
+    EXPECT_EQ(m.encodedSize(), m.data().size());
+  }
+}
+
+TEST(OTAParamRCWire, Reads) {
+  struct Case {
+    const char* name;
+    const char* hex;
+    bool ok;
+    std::function<void(const OTAParamRC&)> check;
+  };
+  const Case cases[] = {
+      {"empty input", "", true,
+       [](const OTAParamRC& m) {
+         OTAParamRC fresh;
+         EXPECT_TRUE(m.isEqual(&fresh));
+       }},
+      {"varint wider than 32 bits keeps the low bits", "90 01 85 80 80 80 10", true,
+       [](const OTAParamRC& m) { EXPECT_EQ(m.chemID(), 5u); }},
+      {"ten-byte varint with top bit still set is 0 and reading goes on",
+       "90 01 FF FF FF FF FF FF FF FF FF FF E8 02 01", true,
+       [](const OTAParamRC& m) {
+         EXPECT_EQ(m.chemID(), 0u);
+         EXPECT_EQ(m.mLBConfig(), 1);
+       }},
+      {"negative mLBConfig", "E8 02 FF FF FF FF FF FF FF FF FF 01", true,
+       [](const OTAParamRC& m) { EXPECT_EQ(m.mLBConfig(), -1); }},
+      {"unnamed mLBConfig", "E8 02 07", true,
+       [](const OTAParamRC& m) { EXPECT_EQ(m.mLBConfig(), 7); }},
+      {"field number compared on its low 32 bits", "90 81 80 80 80 01 09", true,
+       [](const OTAParamRC& m) { EXPECT_EQ(m.chemID(), 9u); }},
+      {"float field sent as varint is read as four bytes", "A8 01 00 00 80 3F", true,
+       [](const OTAParamRC& m) { EXPECT_EQ(m.maxRdcRatio(), 1.0f); }},
+      {"varint field sent as fixed32 is read as varint", "95 01 05 E8 02 01", true,
+       [](const OTAParamRC& m) {
+         EXPECT_EQ(m.chemID(), 5u);
+         EXPECT_EQ(m.mLBConfig(), 1);
+       }},
+      {"last sub-message occurrence wins", "0A 05 0D 00 00 80 3F 0A 05 0D 00 00 00 40", true,
+       [](const OTAParamRC& m) {
+         EXPECT_EQ(list(m.r0()->resistance25Cs(), m.r0()->resistance25CsCount()),
+                   std::vector<float>{2.0f});
+       }},
+      {"packed and unpacked accumulate in order",
+       "4A 08 00 00 80 3F 00 00 00 40 4D 00 00 40 40 4A 00 4D 00 00 80 40", true,
+       [](const OTAParamRC& m) {
+         EXPECT_EQ(list(m.agingCoeffForR0s(), m.agingCoeffForR0sCount()),
+                   (std::vector<float>{1, 2, 3, 4}));
+       }},
+      {"unknown fields of every wire type are skipped",
+       "90 03 96 01 91 03 01 02 03 04 05 06 07 08 92 03 02 AA BB 93 03 08 01 94 03 "
+       "95 03 01 02 03 04 00 05 90 01 07",
+       true, [](const OTAParamRC& m) { EXPECT_EQ(m.chemID(), 7u); }},
+      {"over-long tag is field 0 and skipped as a varint",
+       "FF FF FF FF FF FF FF FF FF FF 05 90 01 07", true,
+       [](const OTAParamRC& m) { EXPECT_EQ(m.chemID(), 7u); }},
+      {"end-group at top level ends the read", "90 01 07 0C 90 01 08", true,
+       [](const OTAParamRC& m) { EXPECT_EQ(m.chemID(), 7u); }},
+      {"truncated tag", "90", false, [](const OTAParamRC&) {}},
+      {"truncated varint leaves 0 and the has-bit", "90 01 07 E8 02 81", false,
+       [](const OTAParamRC& m) {
+         EXPECT_EQ(m.chemID(), 7u);
+         EXPECT_TRUE(m.hasMLBConfig());
+         EXPECT_EQ(m.mLBConfig(), 0);
+       }},
+      {"truncated float leaves 0.0 and the has-bit", "90 01 07 AD 01 00 00", false,
+       [](const OTAParamRC& m) {
+         EXPECT_TRUE(m.hasMaxRdcRatio());
+         EXPECT_EQ(m.maxRdcRatio(), 0.0f);
+       }},
+      {"packed run not a multiple of 4 appends 0.0", "4A 06 00 00 80 3F 00 00", false,
+       [](const OTAParamRC& m) {
+         EXPECT_EQ(list(m.agingCoeffForR0s(), m.agingCoeffForR0sCount()),
+                   (std::vector<float>{1, 0}));
+       }},
+      {"packed run past the end", "4A 09 00 00 80 3F", false,
+       [](const OTAParamRC& m) { EXPECT_EQ(m.agingCoeffForR0sCount(), 0u); }},
+      {"sub-message length past the end leaves it present", "8A 01 05 00", false,
+       [](const OTAParamRC& m) {
+         ASSERT_TRUE(m.hasBmuResistance());
+         EXPECT_FALSE(m.bmuResistance()->hasTraceResistance25C());
+       }},
+      {"failed sub-message keeps what it read", "0A 07 0D 00 00 80 3F 15 00", false,
+       [](const OTAParamRC& m) {
+         EXPECT_EQ(list(m.r0()->resistance25Cs(), m.r0()->resistance25CsCount()),
+                   (std::vector<float>{1}));
+         EXPECT_EQ(list(m.r0()->temperatureCoeffs(), m.r0()->temperatureCoeffsCount()),
+                   (std::vector<float>{0}));
+       }},
+      {"wire type 6 on an unknown field", "96 03 00", false, [](const OTAParamRC&) {}},
+      {"unknown length-delimited past the end", "92 03 05 00", false, [](const OTAParamRC&) {}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    OTAParamRC m;
+    EXPECT_EQ(decode(m, fromHex(c.hex)), c.ok);
+    c.check(m);
+  }
+}
+
+TEST(OTAParamRCWire, RewritesReadListsUnpacked) {
+  OTAParamRC m;
+  ASSERT_TRUE(decode(m, fromHex("4A 08 00 00 80 3F 00 00 00 40 4D 00 00 40 40")));
+  EXPECT_EQ(toHex(m.data()), "4D 00 00 80 3F 4D 00 00 00 40 4D 00 00 40 40 90 01 00");
+}
+
+TEST(OTABMUResistanceWire, ReadsEveryWireTypeAsFixed32) {
+  OTABMUResistance m;
+  EXPECT_TRUE(decode(m, fromHex("18 00 00 80 3F 2D 00 00 00 40")));
+  EXPECT_EQ(m.systemEquivalentResistance(), 1.0f);
+  EXPECT_EQ(m.downstreamNorthResistance(), 2.0f);
+  EXPECT_EQ(toHex(m.data()), "1D 00 00 80 3F 2D 00 00 00 40");
+
+  OTABMUResistance cut;
+  EXPECT_FALSE(decode(cut, fromHex("15 00 00")));
+  EXPECT_TRUE(cut.hasTraceResistanceTemperatureCoeff());
+  EXPECT_EQ(cut.traceResistanceTemperatureCoeff(), 0.0f);
+}
+
+TEST(PBReaderSkipValueWithTag, SkipsWhatItCanAndRefusesTheRest) {
+  struct Case {
+    const char* name;
+    uint8_t wireType;
+    const char* hex;  // the value after a tag for field 7
+    bool ok;
+    size_t end;
+  };
+  const Case cases[] = {
+      {"varint", 0, "96 01 FF", true, 2},
+      {"truncated varint", 0, "96", false, 1},
+      {"fixed64", 1, "01 02 03 04 05 06 07 08", true, 8},
+      {"truncated fixed64", 1, "01 02 03 04 05 06 07", false, 0},
+      {"length-delimited", 2, "03 AA BB CC DD", true, 4},
+      {"length past the end", 2, "05 AA", false, 1},
+      {"nested groups", 3, "08 01 3B 10 02 3C 3C 00", true, 7},
+      {"group closed by another field", 3, "08 01 44", false, 3},
+      {"group never closed", 3, "08 01", false, 2},
+      {"stray end-group", 4, "", false, 0},
+      {"fixed32", 5, "01 02 03 04", true, 4},
+      {"truncated fixed32", 5, "01 02 03", false, 0},
+      {"wire type 6", 6, "00", false, 0},
+      {"wire type 7", 7, "00", false, 0},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const std::vector<uint8_t> bytes = fromHex(c.hex);
+    PBDataReader reader(bytes.data(), bytes.size());
+    EXPECT_EQ(PBReaderSkipValueWithTag(reader, 7, c.wireType), c.ok);
+    EXPECT_EQ(reader.position(), c.end);
+  }
+}
+
+TEST(PBReaderSkipValueWithTag, BoundsGroupNesting) {
+  for (size_t depth : {kMaxGroupDepth, kMaxGroupDepth + 1}) {
+    // The caller has read the first start tag; the rest follow.
+    std::vector<uint8_t> bytes(depth - 1, 0x3B);
+    bytes.insert(bytes.end(), depth, 0x3C);
+    PBDataReader reader(bytes.data(), bytes.size());
+    EXPECT_EQ(PBReaderSkipValueWithTag(reader, 7, 3), depth == kMaxGroupDepth) << depth;
+  }
+}
+
+}  // namespace
+}  // namespace kolvrand
