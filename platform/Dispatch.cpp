@@ -42,6 +42,9 @@ struct Core {
   bool busy = false;
   bool stopping = false;
   std::thread::id worker;
+
+  std::mutex joinMutex;  // the queue and dispatch_main may both join
+  std::thread thread;
 };
 
 void runBlock(Core& core, dispatch_block_t& block) {
@@ -107,6 +110,13 @@ void remember(const std::shared_ptr<Core>& core) {
   t.cores.push_back(core);
 }
 
+// Waits for the worker to leave its loop, from any thread but the worker's.
+void joinCore(Core& core) {
+  std::lock_guard lock(core.joinMutex);
+  if (core.thread.joinable() && core.thread.get_id() != std::this_thread::get_id())
+    core.thread.join();
+}
+
 void stopAllQueues() {
   std::vector<std::shared_ptr<Core>> live;
   {
@@ -116,13 +126,13 @@ void stopAllQueues() {
       if (auto c = w.lock()) live.push_back(std::move(c));
   }
   for (auto& c : live) stopCore(*c);
+  for (auto& c : live) joinCore(*c);
 }
 
 }  // namespace
 
 struct DispatchQueue::State {
   std::shared_ptr<Core> core;
-  std::thread thread;
   dispatch_queue_attr_t attr;
 };
 
@@ -135,24 +145,30 @@ DispatchQueue::DispatchQueue(std::string label, dispatch_queue_attr_t attr)
   // thread's mask, so they always reach dispatch_main.
   sigset_t served = servedSignals(), old;
   pthread_sigmask(SIG_BLOCK, &served, &old);
-  s_->thread = std::thread(workerLoop, s_->core);
+  std::thread worker(workerLoop, s_->core);
   pthread_sigmask(SIG_SETMASK, &old, nullptr);
   {
     std::lock_guard lock(s_->core->mutex);
-    s_->core->worker = s_->thread.get_id();
+    s_->core->worker = worker.get_id();
+  }
+  {
+    std::lock_guard lock(s_->core->joinMutex);
+    s_->core->thread = std::move(worker);
   }
   remember(s_->core);
 }
 
 DispatchQueue::~DispatchQueue() {
-  stopCore(*s_->core);
-  if (!s_->thread.joinable()) return;
+  Core& core = *s_->core;
+  stopCore(core);
+  std::lock_guard lock(core.joinMutex);
+  if (!core.thread.joinable()) return;
   // Released from one of its own blocks: the worker cannot join itself; it
   // leaves its loop on its own and then drops the last reference to the core.
-  if (s_->thread.get_id() == std::this_thread::get_id())
-    s_->thread.detach();
+  if (core.thread.get_id() == std::this_thread::get_id())
+    core.thread.detach();
   else
-    s_->thread.join();
+    core.thread.join();
 }
 
 const std::string& DispatchQueue::label() const {
@@ -183,7 +199,7 @@ void DispatchQueue::drain() {
 
 void DispatchQueue::stop() {
   stopCore(*s_->core);
-  if (s_->thread.joinable() && s_->thread.get_id() != std::this_thread::get_id()) s_->thread.join();
+  joinCore(*s_->core);
 }
 
 dispatch_queue_attr_t dispatch_queue_attr_make_with_autorelease_frequency(
