@@ -16,7 +16,8 @@ namespace kolvrand {
 
 class NSUserDefaults {
  public:
-  // nil only when the state directory cannot be created or opened. The
+  // nil only when the state directory cannot be created or opened, or when
+  // the suite name is no file name ("", ".", "..", or with a '/'). The
   // directory is the backend's state directory.
   static std::shared_ptr<NSUserDefaults> initWithSuiteName(std::string_view suite);
   // The same, in an explicit directory.

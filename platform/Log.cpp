@@ -55,12 +55,12 @@ std::optional<LogLevel> parseLevel(std::string_view s) {
 
 // Items apply in order: a bare level sets every category (earlier
 // per-category items included), CATEGORY=LEVEL sets one.
-LevelConfig parseLevelSpec(std::string_view spec) {
+LevelConfig parseLevels(std::string_view list) {
   LevelConfig config;
-  while (!spec.empty()) {
-    size_t comma = spec.find(',');
-    std::string_view item = trim(spec.substr(0, comma));
-    spec = comma == std::string_view::npos ? std::string_view() : spec.substr(comma + 1);
+  while (!list.empty()) {
+    size_t comma = list.find(',');
+    std::string_view item = trim(list.substr(0, comma));
+    list = comma == std::string_view::npos ? std::string_view() : list.substr(comma + 1);
     size_t eq = item.find('=');
     if (eq == std::string_view::npos) {
       if (auto level = parseLevel(item)) {
@@ -160,8 +160,10 @@ class JournalSink final : public LogSink {
 
 // systemd sets JOURNAL_STREAM to the device and inode of the stream it
 // connected stdout/stderr to; if fd 2 is still that stream, the journal gets
-// structured entries rather than bare lines.
+// structured entries rather than bare lines. The native socket must exist
+// too: entries sent without it vanish without an error.
 bool stderrIsJournal() {
+  if (::access("/run/systemd/journal/socket", F_OK) != 0) return false;
   const char* env = std::getenv("JOURNAL_STREAM");
   if (!env) return false;
   uintmax_t dev = 0, ino = 0;
@@ -366,9 +368,9 @@ void setLogSink(std::shared_ptr<LogSink> sink) {
   s.installed = std::move(sink);
 }
 
-void setLogLevelSpec(std::string_view spec) {
+void setLogLevelSpec(std::string_view levels) {
   LevelState& s = levelState();
-  LevelConfig config = parseLevelSpec(spec);
+  LevelConfig config = parseLevels(levels);
   std::lock_guard lock(s.mutex);
   s.config = std::move(config);
   s.configured = true;
@@ -388,7 +390,7 @@ os_log_t os_log_create(const char* subsystem, const char* category) {
     std::lock_guard lock(s.mutex);
     if (!s.configured) {
       s.configured = true;
-      if (const char* env = std::getenv("KOLVRAND_LOG_LEVEL")) s.config = parseLevelSpec(env);
+      if (const char* env = std::getenv("KOLVRAND_LOG_LEVEL")) s.config = parseLevels(env);
     }
   }
   return std::make_shared<const OSLog>(subsystem ? subsystem : "", category ? category : "");

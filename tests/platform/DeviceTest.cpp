@@ -9,6 +9,7 @@
 #include "platform/Defaults.h"
 #include "platform/FileManager.h"
 #include "platform/IOKit.h"
+#include "platform/Internal.h"
 #include "platform/Sysctl.h"
 #include "platform/ValueJSON.h"
 #include "tests/platform/TestUtil.h"
@@ -25,16 +26,6 @@ constexpr const char* kDevice = R"({
     "TesvarKVR": {}
   }
 })";
-
-std::string hex(const uint8_t* p, size_t n) {
-  std::string s;
-  char buf[3];
-  for (size_t i = 0; i < n; ++i) {
-    std::snprintf(buf, sizeof buf, "%02x", p[i]);
-    s += buf;
-  }
-  return s;
-}
 
 std::optional<std::string> readSysctl(const char* name) {
   size_t len = 0;
@@ -303,7 +294,7 @@ TEST(SHA1, MatchesTheStandardVectors) {
   };
   for (const auto& c : cases) {
     SHA1Digest oneShot = sha1(c.input.data(), c.input.size());
-    EXPECT_EQ(hex(oneShot.data(), oneShot.size()), c.digest);
+    EXPECT_EQ(platform::toHex(oneShot.data(), oneShot.size()), c.digest);
     // The same digest when fed in uneven pieces.
     CC_SHA1_CTX ctx;
     ASSERT_EQ(CC_SHA1_Init(&ctx), 1);
@@ -311,7 +302,7 @@ TEST(SHA1, MatchesTheStandardVectors) {
       ASSERT_EQ(CC_SHA1_Update(&ctx, c.input.data() + at, std::min(step, c.input.size() - at)), 1);
     uint8_t md[CC_SHA1_DIGEST_LENGTH];
     ASSERT_EQ(CC_SHA1_Final(md, &ctx), 1);
-    EXPECT_EQ(hex(md, sizeof md), c.digest);
+    EXPECT_EQ(platform::toHex(md, sizeof md), c.digest);
   }
 }
 

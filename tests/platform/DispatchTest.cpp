@@ -106,17 +106,9 @@ class MainLoopChild {
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_adddup2(&actions, fds[1], STDOUT_FILENO);
     posix_spawn_file_actions_addclose(&actions, fds[0]);
-    // The test process blocks these signals; the child must start clean.
-    posix_spawnattr_t attr;
-    posix_spawnattr_init(&attr);
-    sigset_t none;
-    sigemptyset(&none);
-    posix_spawnattr_setsigmask(&attr, &none);
-    posix_spawnattr_setflags(&attr, POSIX_SPAWN_SETSIGMASK);
     char* argv[] = {const_cast<char*>(DISPATCH_MAIN_CHILD), const_cast<char*>(scenario), nullptr};
-    EXPECT_EQ(posix_spawn(&pid_, DISPATCH_MAIN_CHILD, &actions, &attr, argv, environ), 0);
+    EXPECT_EQ(posix_spawn(&pid_, DISPATCH_MAIN_CHILD, &actions, nullptr, argv, environ), 0);
     posix_spawn_file_actions_destroy(&actions);
-    posix_spawnattr_destroy(&attr);
     ::close(fds[1]);
     out_ = fds[0];
   }

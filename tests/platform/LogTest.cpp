@@ -64,13 +64,13 @@ TEST(FormatLogMessage, MatchesPrintf) {
 }
 
 struct LevelCase {
-  const char* spec;
+  const char* levels;
   const char* category;
   LogLevel level;
   bool enabled;
 };
 
-TEST(LogLevelSpec, EnablesLevelsPerCategory) {
+TEST(LogLevels, EnablesLevelsPerCategory) {
   const LevelCase cases[] = {
       {"", "main", LogLevel::Error, true},
       {"", "main", LogLevel::Default, true},
@@ -92,9 +92,9 @@ TEST(LogLevelSpec, EnablesLevelsPerCategory) {
       {"verbose,main=loud,=debug", "main", LogLevel::Debug, false},
   };
   for (const auto& c : cases) {
-    setLogLevelSpec(c.spec);
+    setLogLevelSpec(c.levels);
     EXPECT_EQ(os_log_create("com.tesvar.kolvrand", c.category)->enabled(c.level), c.enabled)
-        << "spec \"" << c.spec << "\" category " << c.category << " level "
+        << "levels \"" << c.levels << "\" category " << c.category << " level "
         << static_cast<int>(c.level);
   }
   setLogLevelSpec("");
