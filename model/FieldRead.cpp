@@ -18,17 +18,35 @@ void readPackedRun(PBDataReader& reader, PBRepeatedFloat& list) {
   if (!reader.isAtEnd()) list.add(reader.readFloat());
 }
 
+// Whether the `size` bytes at `p` are the tag bytes at `tag`; tags of one and
+// two bytes, all a message of fewer than 2048 fields has, skip the memcmp call.
+bool sameTag(const uint8_t* p, const uint8_t* tag, size_t size) {
+  switch (size) {
+    case 1:
+      return p[0] == tag[0];
+    case 2:
+      return p[0] == tag[0] && p[1] == tag[1];
+    default:
+      return std::memcmp(p, tag, size) == 0;
+  }
+}
+
 // One unpacked element, whose tag is the `tagSize` bytes at `tag`, then every
 // directly following entry with the very same tag bytes: the usual shape of a
-// list written unpacked, taken without going back through the dispatch.
+// list written unpacked. The run is counted first (only whole entries before
+// the limit), so the list grows once and the dispatch loop is not re-entered
+// per element.
 void readUnpackedRun(PBDataReader& reader, PBRepeatedFloat& list, const uint8_t* tag,
                      size_t tagSize) {
   list.add(reader.readFloat());
   if (reader.hasError()) return;
-  while (reader.remaining() >= tagSize + 4 && std::memcmp(reader.cursor(), tag, tagSize) == 0) {
-    list.add(wire::loadFloat(reader.cursor() + tagSize));
-    reader.advance(tagSize + 4);
-  }
+  const size_t stride = tagSize + 4;
+  const size_t fit = reader.remaining() / stride;
+  const uint8_t* p = reader.cursor();
+  size_t n = 0;
+  while (n < fit && sameTag(p + n * stride, tag, tagSize)) ++n;
+  list.appendStrided(p + tagSize, n, stride);
+  reader.advance(n * stride);
 }
 
 }  // namespace

@@ -11,11 +11,19 @@ namespace {
 void writeList(const FieldDescriptor& d, const PBRepeatedFloat& list, PBDataWriter& writer) {
   const size_t n = list.size();
   if (n == 0) return;
-  uint8_t* out = writer.append(n * (d.tagSize + 4));
-  for (const float *p = list.elements(), *end = p + n; p != end; ++p) {
-    std::memcpy(out, d.tag.data(), d.tagSize);
-    wire::storeFloat(out + d.tagSize, *p);
-    out += d.tagSize + 4;
+  const size_t stride = d.tagSize + 4;
+  uint8_t* out = writer.append(n * stride);
+  const float* values = list.elements();
+  if (d.tagSize == 1) {
+    for (size_t i = 0; i < n; ++i, out += stride) {
+      out[0] = d.tag[0];
+      wire::storeFloat(out + 1, values[i]);
+    }
+  } else {
+    for (size_t i = 0; i < n; ++i, out += stride) {
+      std::memcpy(out, d.tag.data(), d.tagSize);
+      wire::storeFloat(out + d.tagSize, values[i]);
+    }
   }
 }
 

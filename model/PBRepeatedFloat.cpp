@@ -39,6 +39,13 @@ void PBRepeatedFloat::appendLittleEndian(const uint8_t* bytes, size_t count) {
   }
 }
 
+void PBRepeatedFloat::appendStrided(const uint8_t* bytes, size_t count, size_t stride) {
+  const size_t old = values_.size();
+  values_.resize(old + count);
+  float* out = values_.data() + old;
+  for (size_t i = 0; i < count; ++i) out[i] = wire::loadFloat(bytes + i * stride);
+}
+
 bool PBRepeatedFloatIsEqual(const PBRepeatedFloat& a, const PBRepeatedFloat& b) {
   if (a.size() != b.size()) return false;
   return std::equal(a.elements(), a.elements() + a.size(), b.elements());

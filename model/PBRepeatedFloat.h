@@ -40,6 +40,10 @@ class PBRepeatedFloat {
   // 4 * count readable bytes.
   void appendLittleEndian(const uint8_t* bytes, size_t count);
 
+  // Appends `count` little-endian floats, the i-th at bytes + i * stride;
+  // requires those 4-byte spans to be readable.
+  void appendStrided(const uint8_t* bytes, size_t count, size_t stride);
+
  private:
   [[noreturn]] static void throwOutOfRange(size_t index, size_t count);
 

@@ -149,6 +149,10 @@ TEST(OTAParamRCWire, Reads) {
          EXPECT_EQ(list(m.agingCoeffForR0s(), m.agingCoeffForR0sCount()),
                    (std::vector<float>{1, 0}));
        }},
+      {"unpacked run cut short appends 0.0", "9D 01 00 00 80 3F 9D 01 00 00 00 40 9D 01 00", false,
+       [](const OTAParamRC& m) {
+         EXPECT_EQ(list(m.gridOCVs(), m.gridOCVsCount()), (std::vector<float>{1, 2, 0}));
+       }},
       {"packed run past the end", "4A 09 00 00 80 3F", false,
        [](const OTAParamRC& m) { EXPECT_EQ(m.agingCoeffForR0sCount(), 0u); }},
       {"sub-message length past the end leaves it present", "8A 01 05 00", false,
