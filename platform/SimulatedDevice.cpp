@@ -2,12 +2,14 @@
 // tests on machines without the battery and power-management drivers:
 //
 //   DEVICE/device.json                 kernel variables, registry, driver results
+//                                      (a property given as null is absent)
 //   DEVICE/Library                     the system Library directory
 //   DEVICE/state                       the defaults suites
 //   DEVICE/driver/battery_params.bin   the last record the driver accepted
 #include <cstring>
 #include <map>
 #include <mutex>
+#include <set>
 #include <vector>
 
 #include "platform/Backend.h"
@@ -56,15 +58,15 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
   // Registry: a service handle is the class's position in device.json, from 1.
   uint32_t findService(std::string_view className) override {
     for (size_t i = 0; i < classes_.size(); ++i)
-      if (classes_[i].first == className) return static_cast<uint32_t>(i + 1);
+      if (classes_[i].name == className) return static_cast<uint32_t>(i + 1);
     return 0;
   }
 
   std::optional<Value> property(uint32_t service, std::string_view key) override {
     const auto* entry = serviceEntry(service);
-    if (!entry) return std::nullopt;
-    if (const Value* v = entry->second.find(key)) return *v;
-    if (entry->first == kDriverClass && key == kHashProperty) return publishedHash();
+    if (!entry || entry->absent.contains(key)) return std::nullopt;
+    if (const Value* v = entry->properties.find(key)) return *v;
+    if (entry->name == kDriverClass && key == kHashProperty) return publishedHash();
     return std::nullopt;
   }
 
@@ -73,7 +75,7 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
     *connection = 0;
     const auto* entry = serviceEntry(service);
     if (!entry || type != 0) return kIOReturnBadArgument;
-    if (entry->first != kDriverClass) return kIOReturnUnsupported;
+    if (entry->name != kDriverClass) return kIOReturnUnsupported;
     if (openResult_ != 0) return openResult_;
     std::lock_guard lock(mutex_);
     uint32_t id = nextConnection_++;
@@ -109,7 +111,12 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
   }
 
  private:
-  using ClassEntry = std::pair<std::string, Dictionary>;
+  struct ClassEntry {
+    std::string name;
+    Dictionary properties;
+    // Given as null: absent, even where the driver would publish a value.
+    std::set<std::string, std::less<>> absent;
+  };
 
   std::filesystem::path paramsPath() const { return root_ / "driver" / "battery_params.bin"; }
 
@@ -181,14 +188,18 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
       if (!it->is_object()) return fail(error, "registry is not an object");
       for (auto c = it->begin(); c != it->end(); ++c) {
         if (!c->is_object()) return fail(error, "registry class " + c.key() + " is not an object");
-        Dictionary props;
+        ClassEntry entry{c.key(), {}, {}};
         for (auto p = c->begin(); p != c->end(); ++p) {
+          if (p->is_null()) {
+            entry.absent.insert(p.key());
+            continue;
+          }
           std::string why;
           auto value = valueFromJSON(*p, &why);
           if (!value) return fail(error, "registry " + c.key() + "." + p.key() + ": " + why);
-          props.set(p.key(), std::move(*value));
+          entry.properties.set(p.key(), std::move(*value));
         }
-        classes_.emplace_back(c.key(), std::move(props));
+        classes_.push_back(std::move(entry));
       }
     }
 

@@ -112,7 +112,7 @@ TEST_F(SimulatedDevice, BadDeviceFilesGiveAnEmptyDevice) {
       R"({"sysctl": {"kern.bootsessionuuid": {"$data": "abc"}}})",
       R"({"sysctl": {"kern.bootsessionuuid": {"$data": "zz"}}})",
       R"({"registry": {"TesvarSmartBattery": 1}})",
-      R"({"registry": {"TesvarSmartBattery": {"BatteryData": null}}})",
+      R"({"registry": {"TesvarSmartBattery": {"BatteryData": {"AlgoChemID": null}}}})",
       R"({"driver": {"openResult": "0"}})",
       R"({"driver": {"openResult": 1.5}})",
       R"({"driver": {"setBatteryParamsResult": 1099511627776}})",
@@ -229,6 +229,11 @@ TEST_F(SimulatedDriver, PublishesAKVRVectorFromDeviceJsonAsGiven) {
   EXPECT_EQ(published(), given);
   ASSERT_EQ(send(open(), record(3)), kIOReturnSuccess);
   EXPECT_EQ(published(), given);
+
+  // null: the driver publishes no KVRVector at all.
+  makeDevice(R"({"registry": {"TesvarKVR": {"KVRVector": null}}})");
+  EXPECT_FALSE(published());
+  EXPECT_TRUE(std::filesystem::exists(kept()));
 }
 
 TEST_F(SimulatedDevice, DirectoriesLiveInTheDevice) {
