@@ -18,8 +18,8 @@ void readPackedRun(PBDataReader& reader, PBRepeatedFloat& list) {
   if (!reader.isAtEnd()) list.add(reader.readFloat());
 }
 
-// Whether the `size` bytes at `p` are the tag bytes at `tag`; tags of one and
-// two bytes, all a message of fewer than 2048 fields has, skip the memcmp call.
+// Whether the `size` bytes at `p` are the tag bytes at `tag`. Field numbers
+// below 2048 have one- or two-byte tags, compared without a memcmp call.
 bool sameTag(const uint8_t* p, const uint8_t* tag, size_t size) {
   switch (size) {
     case 1:
@@ -75,6 +75,8 @@ bool readFields(const MessageTable& table, MutableFields fields, PBDataReader& r
         PBDataReaderMark mark;
         if (!PBReaderPlaceMark(reader, mark)) return false;
         if (!message->readFrom(reader)) return false;
+        // A sub-message that stopped at an end-group tag leaves the position
+        // inside its run; reading goes on from there.
         PBReaderRecallMark(reader, mark);
         break;
       }

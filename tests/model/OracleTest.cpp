@@ -13,7 +13,7 @@
 #include "model/OTAParamRC.h"
 #include "oracle_packed.pb.h"
 #include "oracle_plain.pb.h"
-#include "tests/model/Hex.h"
+#include "tests/model/Support.h"
 
 namespace kolvrand {
 namespace {

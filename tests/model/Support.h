@@ -1,5 +1,5 @@
-// Byte strings written and compared as hex text, so a failing test shows the
-// bytes it got.
+// Helpers of the model tests: byte strings written and compared as hex text (so
+// a failing test shows the bytes it got), decoding, and lists as vectors.
 #pragma once
 
 #include <cstdint>
@@ -37,6 +37,11 @@ inline std::string toHex(const std::vector<uint8_t>& bytes) {
     out += digits[b & 15];
   }
   return out;
+}
+
+inline std::vector<float> list(const float* elements, size_t count) {
+  if (!elements) return {};
+  return std::vector<float>(elements, elements + count);
 }
 
 inline bool decode(PBCodable& message, const std::vector<uint8_t>& bytes) {

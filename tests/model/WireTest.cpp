@@ -6,19 +6,15 @@
 #include <vector>
 
 #include "model/OTAParamRC.h"
-#include "tests/model/Hex.h"
+#include "tests/model/Support.h"
 
 namespace kolvrand {
 namespace {
 
 using test::decode;
 using test::fromHex;
+using test::list;
 using test::toHex;
-
-std::vector<float> list(const float* p, size_t n) {
-  if (!p) return {};
-  return std::vector<float>(p, p + n);
-}
 
 TEST(OTAParamRCWire, WritesExactBytes) {
   struct Case {
@@ -182,19 +178,6 @@ TEST(OTAParamRCWire, RewritesReadListsUnpacked) {
   OTAParamRC m;
   ASSERT_TRUE(decode(m, fromHex("4A 08 00 00 80 3F 00 00 00 40 4D 00 00 40 40")));
   EXPECT_EQ(toHex(m.data()), "4D 00 00 80 3F 4D 00 00 00 40 4D 00 00 40 40 90 01 00");
-}
-
-TEST(OTABMUResistanceWire, ReadsEveryWireTypeAsFixed32) {
-  OTABMUResistance m;
-  EXPECT_TRUE(decode(m, fromHex("18 00 00 80 3F 2D 00 00 00 40")));
-  EXPECT_EQ(m.systemEquivalentResistance(), 1.0f);
-  EXPECT_EQ(m.downstreamNorthResistance(), 2.0f);
-  EXPECT_EQ(toHex(m.data()), "1D 00 00 80 3F 2D 00 00 00 40");
-
-  OTABMUResistance cut;
-  EXPECT_FALSE(decode(cut, fromHex("15 00 00")));
-  EXPECT_TRUE(cut.hasTraceResistanceTemperatureCoeff());
-  EXPECT_EQ(cut.traceResistanceTemperatureCoeff(), 0.0f);
 }
 
 TEST(PBReaderSkipValueWithTag, SkipsWhatItCanAndRefusesTheRest) {
