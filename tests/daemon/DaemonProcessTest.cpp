@@ -58,10 +58,10 @@ TEST(Daemon, FirstStartUploadsRunsTheActivityAndStopsCleanly) {
   DeviceCopy device;
   test::DaemonProcess daemon(device.dir());
   ASSERT_TRUE(daemon.running());
-  ASSERT_TRUE(daemon.waitForLine("Battery data upload"));
-  ASSERT_TRUE(daemon.waitForLine("checking in"));
+  ASSERT_TRUE(daemon.waitForLine({"Battery data upload"}));
+  ASSERT_TRUE(daemon.waitForLine({"checking in"}));
   daemon.signal(SIGUSR1);
-  ASSERT_TRUE(daemon.waitForLine("compensation has finished"));
+  ASSERT_TRUE(daemon.waitForLine({"compensation has finished"}));
   daemon.signal(SIGTERM);
   EXPECT_EQ(daemon.waitForExit(), 0);
 
@@ -80,7 +80,8 @@ TEST(Daemon, FirstStartUploadsRunsTheActivityAndStopsCleanly) {
   activity.insert(activity.end(), kRun.begin(), kRun.end());
   EXPECT_EQ(only(lines, task), task) << daemon.rawStderr();
   EXPECT_EQ(only(lines, activity), activity) << daemon.rawStderr();
-  EXPECT_EQ(lines.size(), task.size() + activity.size()) << daemon.rawStderr();
+  EXPECT_EQ(lines.back(), "debug [dispatch] stopping on signal 15");
+  EXPECT_EQ(lines.size(), task.size() + activity.size() + 1) << daemon.rawStderr();
 
   EXPECT_EQ(device.state(), (nlohmann::json{{"savedBootUUID", device.bootUUID()},
                                             {"savedChemID", 8552},
@@ -92,17 +93,18 @@ TEST(Daemon, SecondStartInTheSameBootSessionSkipsAndAReebootUploadsAgain) {
   for (const char* start : {"first", "second"}) {
     SCOPED_TRACE(start);
     test::DaemonProcess daemon(device.dir(), "default");
-    ASSERT_TRUE(daemon.waitForLine("upload succeeded") || daemon.waitForLine("Skipping"));
+    ASSERT_TRUE(daemon.waitForLine({"upload succeeded", "Skipping"}));
     daemon.signal(SIGTERM);
     EXPECT_EQ(daemon.waitForExit(), 0);
-    if (std::string(start) == "second")
+    if (std::string(start) == "second") {
       EXPECT_EQ(daemon.lines(), Lines{"default [main] Main Unchanged boot UUID. Skipping battery "
                                       "model task"});
+    }
   }
   device.json()["sysctl"]["kern.bootsessionuuid"] = "99999999-8888-7777-6666-555555555555";
   device.save();
   test::DaemonProcess daemon(device.dir(), "default");
-  ASSERT_TRUE(daemon.waitForLine("Battery data upload"));
+  ASSERT_TRUE(daemon.waitForLine({"Battery data upload"}));
   daemon.signal(SIGTERM);
   EXPECT_EQ(daemon.waitForExit(), 0);
   EXPECT_EQ(daemon.lines(), Lines{"default [main] Battery data upload succeeded"});
@@ -113,7 +115,7 @@ TEST(Daemon, MalformedDeviceFileIsLoggedAndTheDaemonStaysUp) {
   DeviceCopy device;
   std::ofstream(device.dir() / "device.json") << "{ not json";
   test::DaemonProcess daemon(device.dir(), "default");
-  ASSERT_TRUE(daemon.waitForLine("Unable to get current boot UUID"));
+  ASSERT_TRUE(daemon.waitForLine({"Unable to get current boot UUID"}));
   daemon.signal(SIGUSR1);
   daemon.signal(SIGINT);
   EXPECT_EQ(daemon.waitForExit(), 0);

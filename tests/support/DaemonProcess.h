@@ -102,12 +102,14 @@ class DaemonProcess {
     return out;
   }
 
-  // Waits until a line contains `text`.
-  bool waitForLine(const std::string& text,
+  // Waits until a line contains one of `texts`.
+  bool waitForLine(std::initializer_list<std::string_view> texts,
                    std::chrono::seconds timeout = std::chrono::seconds(10)) const {
     auto deadline = std::chrono::steady_clock::now() + timeout;
     while (std::chrono::steady_clock::now() < deadline) {
-      if (rawStderr().find(text) != std::string::npos) return true;
+      std::string err = rawStderr();
+      for (std::string_view text : texts)
+        if (err.find(text) != std::string::npos) return true;
       std::this_thread::sleep_for(std::chrono::milliseconds(10));
     }
     return false;
