@@ -44,7 +44,8 @@ void runBatteryModelTask(const os_log_t& mainLog, BatteryModelDataHandler* handl
   }
 
   uint32_t chemID = handler ? handler->getBatteryChemID() : 0;
-  os_log_debug(mainLog, "Battery data upload run for chemId 0x%lx\n", static_cast<uint64_t>(chemID));
+  os_log_debug(mainLog, "Battery data upload run for chemId 0x%lx\n",
+               static_cast<uint64_t>(chemID));
 
   if (handler && handler->moveBatteryModelDataFromDiskToKext(chemID)) {
     os_log(mainLog, "Battery data upload succeeded\n");

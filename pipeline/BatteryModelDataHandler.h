@@ -36,7 +36,8 @@ class BatteryModelDataHandler {
       const std::optional<std::string>& fileName);
 
   // The kernel record, its upload and verification.
-  std::unique_ptr<KextBatteryModel> createKextModelFromProtobufModel(const OTAParamRC* protobufModel);
+  std::unique_ptr<KextBatteryModel> createKextModelFromProtobufModel(
+      const OTAParamRC* protobufModel);
   bool moveBatteryModelDataFromDiskToKext(uint32_t chemID);
   bool setBatteryModelDataToKernel(const KextBatteryModel* kextModel);
   // Stores an owned copy of the driver's "KVRVector" dictionary in *dict.

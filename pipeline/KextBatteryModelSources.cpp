@@ -7,13 +7,12 @@ namespace kolvrand {
 
 namespace {
 
-#define KEXT_LIST(list, recordField)                                            \
-  KextListSource {                                                              \
-    #list, offsetof(KextBatteryModel, recordField),                             \
-        sizeof(KextBatteryModel::recordField) / sizeof(float),                  \
-        [](const OTAParamRC& m) {                                               \
-          return std::span<const float>(m.list(), static_cast<size_t>(m.list##Count())); \
-        }                                                                       \
+#define KEXT_LIST(list, recordField)                                                                 \
+  KextListSource {                                                                                   \
+#list, offsetof(KextBatteryModel, recordField),                                                  \
+        sizeof(KextBatteryModel::recordField) / sizeof(float),                                       \
+        [](const OTAParamRC&                                                                         \
+               m) { return std::span<const float>(m.list(), static_cast<size_t>(m.list##Count())); } \
   }
 
 constexpr KextListSource kLists[] = {
@@ -42,9 +41,9 @@ constexpr KextListSource kLists[] = {
 };
 #undef KEXT_LIST
 
-#define KEXT_TABLE(field)                                                                       \
-  KextTableSource {                                                                             \
-    #field, offsetof(KextBatteryModel, field),                                                  \
+#define KEXT_TABLE(field)                                                               \
+  KextTableSource {                                                                     \
+#field, offsetof(KextBatteryModel, field),                                          \
         [](const OTAParamRC& m) -> const OTAResistanceData* { return m.field().get(); } \
   }
 
@@ -86,8 +85,14 @@ constexpr KextTableListSource kTableLists[] = {
 
 }  // namespace
 
-std::span<const KextListSource> kextListSources() { return kLists; }
-std::span<const KextTableSource> kextTableSources() { return kTables; }
-std::span<const KextTableListSource> kextTableListSources() { return kTableLists; }
+std::span<const KextListSource> kextListSources() {
+  return kLists;
+}
+std::span<const KextTableSource> kextTableSources() {
+  return kTables;
+}
+std::span<const KextTableListSource> kextTableListSources() {
+  return kTableLists;
+}
 
 }  // namespace kolvrand

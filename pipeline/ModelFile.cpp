@@ -8,8 +8,7 @@
 
 namespace kolvrand {
 
-std::optional<std::string> BatteryModelDataHandler::getBatteryModelFileURLString(
-    uint32_t chemID) {
+std::optional<std::string> BatteryModelDataHandler::getBatteryModelFileURLString(uint32_t chemID) {
   static constexpr const char* kMethod = "-[BatteryModelDataHandler getBatteryModelFileURLString:]";
   NSFileManager& fileManager = NSFileManager::defaultManager();
 

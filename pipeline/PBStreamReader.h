@@ -38,12 +38,13 @@ class PBStreamReader {
     std::vector<std::shared_ptr<Message>> messages;
     size_t offset = 0;
     while (offset < bytes.size()) {
+      const size_t start = offset;
       std::span<const uint8_t> body;
       if (!nextFrame(bytes, &offset, &body, messages.size(), error)) return std::nullopt;
       auto message = std::make_shared<Message>();
       PBDataReader reader(body.data(), body.size());
       if (!message->readFrom(reader)) {
-        if (error) *error = messageError(messages.size(), offset - body.size());
+        if (error) *error = messageError(messages.size(), start);
         return std::nullopt;
       }
       messages.push_back(std::move(message));

@@ -20,7 +20,8 @@ bool BatteryModelDataHandler::moveBatteryModelDataFromDiskToKext(uint32_t chemID
     os_log_error(log_, "%s <Error> protobufModel nil", kMethod);
     return false;
   }
-  std::unique_ptr<KextBatteryModel> kextModel = createKextModelFromProtobufModel(protobufModel.get());
+  std::unique_ptr<KextBatteryModel> kextModel =
+      createKextModelFromProtobufModel(protobufModel.get());
   if (!kextModel) {
     os_log_error(log_, "%s <Error> kextModel nil", kMethod);
     return false;

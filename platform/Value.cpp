@@ -32,10 +32,18 @@ void appendQuoted(std::string& out, std::string_view s) {
   out += '"';
   for (unsigned char c : s) {
     switch (c) {
-      case '"': out += "\\\""; break;
-      case '\\': out += "\\\\"; break;
-      case '\n': out += "\\n"; break;
-      case '\t': out += "\\t"; break;
+      case '"':
+        out += "\\\"";
+        break;
+      case '\\':
+        out += "\\\\";
+        break;
+      case '\n':
+        out += "\\n";
+        break;
+      case '\t':
+        out += "\\t";
+        break;
       default:
         if (c < 0x20) {
           static const char* hex = "0123456789abcdef";
@@ -52,9 +60,15 @@ void appendQuoted(std::string& out, std::string_view s) {
 
 void describe(std::string& out, const Value& v) {
   switch (v.type()) {
-    case Value::Type::Boolean: out += *v.asBoolean() ? "true" : "false"; break;
-    case Value::Type::Number: out += v.asNumber()->description(); break;
-    case Value::Type::String: appendQuoted(out, *v.asString()); break;
+    case Value::Type::Boolean:
+      out += *v.asBoolean() ? "true" : "false";
+      break;
+    case Value::Type::Number:
+      out += v.asNumber()->description();
+      break;
+    case Value::Type::String:
+      appendQuoted(out, *v.asString());
+      break;
     case Value::Type::Data: {
       static const char* hex = "0123456789abcdef";
       out += '<';
@@ -96,40 +110,56 @@ void describe(std::string& out, const Value& v) {
 
 int64_t Number::int64Value() const {
   switch (kind_) {
-    case Kind::Signed: return s_;
-    case Kind::Unsigned: return static_cast<int64_t>(u_);
-    case Kind::Float: return saturate<int64_t>(f_);
-    case Kind::Double: return saturate<int64_t>(d_);
+    case Kind::Signed:
+      return s_;
+    case Kind::Unsigned:
+      return static_cast<int64_t>(u_);
+    case Kind::Float:
+      return saturate<int64_t>(f_);
+    case Kind::Double:
+      return saturate<int64_t>(d_);
   }
   return 0;
 }
 
 uint64_t Number::uint64Value() const {
   switch (kind_) {
-    case Kind::Signed: return static_cast<uint64_t>(s_);
-    case Kind::Unsigned: return u_;
-    case Kind::Float: return saturate<uint64_t>(f_);
-    case Kind::Double: return saturate<uint64_t>(d_);
+    case Kind::Signed:
+      return static_cast<uint64_t>(s_);
+    case Kind::Unsigned:
+      return u_;
+    case Kind::Float:
+      return saturate<uint64_t>(f_);
+    case Kind::Double:
+      return saturate<uint64_t>(d_);
   }
   return 0;
 }
 
 double Number::doubleValue() const {
   switch (kind_) {
-    case Kind::Signed: return static_cast<double>(s_);
-    case Kind::Unsigned: return static_cast<double>(u_);
-    case Kind::Float: return f_;
-    case Kind::Double: return d_;
+    case Kind::Signed:
+      return static_cast<double>(s_);
+    case Kind::Unsigned:
+      return static_cast<double>(u_);
+    case Kind::Float:
+      return f_;
+    case Kind::Double:
+      return d_;
   }
   return 0;
 }
 
 std::string Number::description() const {
   switch (kind_) {
-    case Kind::Signed: return std::to_string(s_);
-    case Kind::Unsigned: return std::to_string(u_);
-    case Kind::Float: return shortest(f_);
-    case Kind::Double: return shortest(d_);
+    case Kind::Signed:
+      return std::to_string(s_);
+    case Kind::Unsigned:
+      return std::to_string(u_);
+    case Kind::Float:
+      return shortest(f_);
+    case Kind::Double:
+      return shortest(d_);
   }
   return {};
 }
@@ -137,10 +167,14 @@ std::string Number::description() const {
 bool Number::operator==(const Number& other) const {
   if (kind_ != other.kind_) return false;
   switch (kind_) {
-    case Kind::Signed: return s_ == other.s_;
-    case Kind::Unsigned: return u_ == other.u_;
-    case Kind::Float: return std::bit_cast<uint32_t>(f_) == std::bit_cast<uint32_t>(other.f_);
-    case Kind::Double: return std::bit_cast<uint64_t>(d_) == std::bit_cast<uint64_t>(other.d_);
+    case Kind::Signed:
+      return s_ == other.s_;
+    case Kind::Unsigned:
+      return u_ == other.u_;
+    case Kind::Float:
+      return std::bit_cast<uint32_t>(f_) == std::bit_cast<uint32_t>(other.f_);
+    case Kind::Double:
+      return std::bit_cast<uint64_t>(d_) == std::bit_cast<uint64_t>(other.d_);
   }
   return false;
 }

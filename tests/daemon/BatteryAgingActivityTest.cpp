@@ -16,8 +16,7 @@ using Lines = std::vector<std::string>;
 const std::string kCheckIn = "debug [main] battery aging update checking in! ";
 const std::string kTrigger = "debug [main] battery aging periodic trigger";
 const std::string kWorkload = "debug [main] trigger condition met, start to run some workload...";
-const std::string kFinished =
-    "debug [main] battery aging compensation has finished successfully";
+const std::string kFinished = "debug [main] battery aging compensation has finished successfully";
 
 struct Case {
   const char* name;
@@ -29,10 +28,17 @@ struct Case {
 
 TEST(BatteryAgingActivity, EachStateLogsAndLeavesTheFlag) {
   const Case cases[] = {
-      {"check-in, flag absent", XPC_ACTIVITY_STATE_CHECK_IN, std::nullopt, {kCheckIn}, std::nullopt},
+      {"check-in, flag absent",
+       XPC_ACTIVITY_STATE_CHECK_IN,
+       std::nullopt,
+       {kCheckIn},
+       std::nullopt},
       {"check-in, flag false", XPC_ACTIVITY_STATE_CHECK_IN, false, {kCheckIn}, false},
-      {"check-in, flag left set", XPC_ACTIVITY_STATE_CHECK_IN, true,
-       {kCheckIn, kWorkload, kFinished}, false},
+      {"check-in, flag left set",
+       XPC_ACTIVITY_STATE_CHECK_IN,
+       true,
+       {kCheckIn, kWorkload, kFinished},
+       false},
       {"run", XPC_ACTIVITY_STATE_RUN, std::nullopt, {kTrigger, kWorkload, kFinished}, false},
       {"run, flag left set", XPC_ACTIVITY_STATE_RUN, true, {kTrigger, kWorkload, kFinished}, false},
       {"wait, flag false", XPC_ACTIVITY_STATE_WAIT, false, {}, false},

@@ -60,9 +60,9 @@ TEST(BatteryModelTask, NilHandlerReadsChemIDZeroAndFails) {
 // Every way the boot-session UUID can be unreadable ends the task at once.
 TEST(BatteryModelTask, UnreadableBootUUIDEndsTheTask) {
   const nlohmann::json cases[] = {
-      nullptr,                                   // no such kernel variable
-      {{"$data", "c328"}},                       // not UTF-8
-      {{"$data", "ff"}},                         // not UTF-8, no NUL
+      nullptr,              // no such kernel variable
+      {{"$data", "c328"}},  // not UTF-8
+      {{"$data", "ff"}},    // not UTF-8, no NUL
   };
   for (const auto& uuid : cases) {
     SCOPED_TRACE(uuid.dump());

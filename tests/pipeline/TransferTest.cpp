@@ -114,23 +114,27 @@ TEST_F(Transfer, EachStageFailureLeavesItsChain) {
        false},
       {"no model file", [](test::TestDevice&, json&) {},
        [](const test::TestDevice& d) {
-         return Lines{kStart, resourceLine(d, kModelPath),
-                      handlerError("getBatteryModelFileURLString:",
-                                   "file not present: " +
-                                       (d.dir() / "Library/KVR/BatteryModels" / kModelPath).string()),
-                      handlerError(kMove, "file (null) does not exist")};
+         return Lines{
+             kStart, resourceLine(d, kModelPath),
+             handlerError("getBatteryModelFileURLString:",
+                          "file not present: " +
+                              (d.dir() / "Library/KVR/BatteryModels" / kModelPath).string()),
+             handlerError(kMove, "file (null) does not exist")};
        },
        false},
       {"a file the reader rejects",
-       [](test::TestDevice& d, json&) { d.installModel(kModelPath, std::string("\x05\x90\x01", 3)); },
+       [](test::TestDevice& d, json&) {
+         d.installModel(kModelPath, std::string("\x05\x90\x01", 3));
+       },
        [](const test::TestDevice& d) {
-         return Lines{kStart, resourceLine(d, kModelPath),
-                      handlerError("loadProtobufModelWithFileName:",
-                                   "readContent error is " +
-                                       (d.dir() / "Library/KVR/BatteryModels" / kModelPath).string() +
-                                       ": message 0 at offset 0 claims 5 bytes but only 2 remain "
-                                       "in the file"),
-                      handlerError(kMove, "protobufModel nil")};
+         return Lines{
+             kStart, resourceLine(d, kModelPath),
+             handlerError("loadProtobufModelWithFileName:",
+                          "readContent error is " +
+                              (d.dir() / "Library/KVR/BatteryModels" / kModelPath).string() +
+                              ": message 0 at offset 0 claims 5 bytes but only 2 remain "
+                              "in the file"),
+             handlerError(kMove, "protobufModel nil")};
        },
        false},
       {"an empty file", [](test::TestDevice& d, json&) { d.installModel(kModelPath, ""); },
@@ -174,8 +178,9 @@ TEST_F(Transfer, EachStageFailureLeavesItsChain) {
        },
        [](const test::TestDevice& d) {
          return Lines{kStart, resourceLine(d, kModelPath),
-                      handlerError(kUpload, "IOServiceOpen fail to connect, ioReturnResult = "
-                                            "-536870212"),
+                      handlerError(kUpload,
+                                   "IOServiceOpen fail to connect, ioReturnResult = "
+                                   "-536870212"),
                       handlerError(kMove, "setBatteryModelDataToKernel failed")};
        },
        false},
@@ -231,19 +236,26 @@ TEST_F(Transfer, EveryHashProblemFailsTheVerification) {
       {"KVRVector not a dictionary", json::array({1, 2}),
        handlerError(kVerify, "getKVRDebugDict failed")},
       {"no KVRBatteryModel", json::object(), handlerError(kVerify, "battModelDict nil")},
-      {"KVRBatteryModel not a dictionary", {{"KVRBatteryModel", "hash"}},
+      {"KVRBatteryModel not a dictionary",
+       {{"KVRBatteryModel", "hash"}},
        handlerError(kVerify, "battModelDict nil")},
-      {"no RCParamsHash", {{"KVRBatteryModel", json::object()}},
+      {"no RCParamsHash",
+       {{"KVRBatteryModel", json::object()}},
        handlerError(kVerify, "RCParamsHash nil")},
-      {"RCParamsHash not data", {{"KVRBatteryModel", {{"RCParamsHash", hex(good)}}}},
+      {"RCParamsHash not data",
+       {{"KVRBatteryModel", {{"RCParamsHash", hex(good)}}}},
        handlerError(kVerify, "RCParamsHash nil")},
-      {"short hash", {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", hex(good.substr(0, 19))}}}}}},
+      {"short hash",
+       {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", hex(good.substr(0, 19))}}}}}},
        mismatchSame},
-      {"long hash", {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", hex(good + '\0')}}}}}},
+      {"long hash",
+       {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", hex(good + '\0')}}}}}},
        mismatchSame},
-      {"last byte differs", {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", hex(lastDiffers)}}}}}},
+      {"last byte differs",
+       {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", hex(lastDiffers)}}}}}},
        mismatchSame},
-      {"empty hash", {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", ""}}}}}},
+      {"empty hash",
+       {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", ""}}}}}},
        handlerError(kVerify, "sentHash " + firstByte + " mismatches with returnedHash 0")},
   };
   for (const Case& c : cases) {

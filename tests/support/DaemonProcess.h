@@ -43,8 +43,8 @@ class DaemonProcess {
 
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, 2, stderrPath_.c_str(),
-                                     O_WRONLY | O_CREAT | O_TRUNC, 0644);
+    posix_spawn_file_actions_addopen(&actions, 2, stderrPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
+                                     0644);
     std::string binary = daemonBinary().string();
     char* argv[] = {binary.data(), nullptr};
     running_ = posix_spawn(&pid_, binary.c_str(), &actions, nullptr, argv, envp.data()) == 0;

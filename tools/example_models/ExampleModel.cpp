@@ -28,7 +28,9 @@ class Jitter {
 
 constexpr int kSocPoints = 51;
 
-double soc(int i) { return static_cast<double>(i) / (kSocPoints - 1); }
+double soc(int i) {
+  return static_cast<double>(i) / (kSocPoints - 1);
+}
 
 // Open-circuit voltage against state of charge, from about 3.0 V empty to
 // 4.4 V full, for three temperature bands a few millivolts apart.
@@ -49,7 +51,8 @@ std::vector<float> gridOCV(Jitter& j) {
 std::vector<float> resistance25C(Jitter& j, double base) {
   std::vector<float> v;
   for (int i = 0; i < kSocPoints; ++i)
-    v.push_back(static_cast<float>(base * (1 + 1.2 * std::exp(-8 * soc(i))) * (1 + 0.02 * j.next())));
+    v.push_back(
+        static_cast<float>(base * (1 + 1.2 * std::exp(-8 * soc(i))) * (1 + 0.02 * j.next())));
   return v;
 }
 
@@ -58,8 +61,8 @@ std::vector<float> temperatureCoeffs(Jitter& j, int perBand) {
   std::vector<float> v;
   for (double band : {0.035, 0.022, 0.012})
     for (int i = 0; i < perBand; ++i)
-      v.push_back(static_cast<float>(band * (1 + 0.3 * (1 - soc(i % kSocPoints))) *
-                                     (1 + 0.05 * j.next())));
+      v.push_back(
+          static_cast<float>(band * (1 + 0.3 * (1 - soc(i % kSocPoints))) * (1 + 0.05 * j.next())));
   return v;
 }
 
@@ -82,7 +85,8 @@ std::vector<float> agingTemperatureCoeffs(Jitter& j) {
 std::vector<float> slopes(Jitter& j, double scale) {
   std::vector<float> v;
   for (int i = 0; i < kSocPoints; ++i)
-    v.push_back(static_cast<float>(-scale * 8 * 1.2 * std::exp(-8 * soc(i)) * (1 + 0.02 * j.next())));
+    v.push_back(
+        static_cast<float>(-scale * 8 * 1.2 * std::exp(-8 * soc(i)) * (1 + 0.02 * j.next())));
   return v;
 }
 
@@ -151,7 +155,8 @@ std::shared_ptr<OTAParamRC> makeExampleModel(uint32_t chemID) {
     setList(*m, setter, agingTemperatureCoeffs(j));
 
   std::vector<float> rdc;
-  for (int i = 0; i < 15; ++i) rdc.push_back(static_cast<float>(0.095 + 0.004 * i + 0.001 * j.next()));
+  for (int i = 0; i < 15; ++i)
+    rdc.push_back(static_cast<float>(0.095 + 0.004 * i + 0.001 * j.next()));
   setList(*m, &OTAParamRC::setBaselineRdcs, rdc);
   setList(*m, &OTAParamRC::setGridOCVs, gridOCV(j));
   setList(*m, &OTAParamRC::setSlopeForR0Extraps, slopes(j, 0.045));

@@ -22,7 +22,8 @@ bool writeModel(const fs::path& path, uint32_t chemID) {
   std::error_code ec;
   fs::create_directories(path.parent_path(), ec);
   std::ofstream out(path, std::ios::binary | std::ios::trunc);
-  out.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
+  out.write(reinterpret_cast<const char*>(bytes.data()),
+            static_cast<std::streamsize>(bytes.size()));
   out.close();
   if (!out) {
     std::fprintf(stderr, "kolvrand-example-models: cannot write %s\n", path.c_str());
@@ -44,9 +45,12 @@ int main(int argc, char** argv) {
     const char* file;
     uint32_t chemID;
   } const models[] = {
-      {"models/R71/1532.rcmodel", 0x1532},  {"models/R70/1552.rcmodel", 0x1552},
-      {"models/R72/1608a.rcmodel", 0x1608}, {"models/R72/1608b.rcmodel", 0x1608},
-      {"models/K517/1821.rcmodel", 0x1821}, {"models/T618e/2168.rcmodel", 0x2168},
+      {"models/R71/1532.rcmodel", 0x1532},
+      {"models/R70/1552.rcmodel", 0x1552},
+      {"models/R72/1608a.rcmodel", 0x1608},
+      {"models/R72/1608b.rcmodel", 0x1608},
+      {"models/K517/1821.rcmodel", 0x1821},
+      {"models/T618e/2168.rcmodel", 0x2168},
       {"models/T604/1886.rcmodel", 0x1886},
       {"device/Library/KVR/BatteryModels/T618e/2168.rcmodel", 0x2168},
   };

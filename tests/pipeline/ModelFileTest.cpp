@@ -1,0 +1,183 @@
+// Finding and reading the model file: device type, path rules, and the stream
+// reader's refusals.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <fstream>
+
+#include "model/OTAParamRC.h"
+#include "pipeline/BatteryModelDataHandler.h"
+#include "pipeline/PBStreamReader.h"
+#include "tests/support/ModelFiles.h"
+#include "tests/support/TestDevice.h"
+
+namespace kolvrand {
+namespace {
+
+namespace fs = std::filesystem;
+using Lines = std::vector<std::string>;
+using nlohmann::json;
+
+const std::string kHandler = "[batteryModelDataHandling] ";
+
+TEST(DeviceType, TableRowsNeedNoKernelQuery) {
+  const std::pair<uint32_t, const char*> rows[] = {
+      {5426, "R71"},   {5458, "R70"},  {5638, "R70"},   {5639, "R72"},   {5640, "R72"},
+      {5648, "R72"},   {5649, "R72"},  {5689, "R70"},   {6177, "K517"},  {6201, "T618e"},
+      {6249, "K517"},  {6259, "K517"}, {6278, "T604"},  {6408, "T618e"}, {6436, "T618e"},
+      {6439, "T618e"}, {6489, "T604"}, {8552, "T618e"},
+  };
+  json j = test::defaultDeviceJSON();
+  j["sysctl"].erase("hw.targettype");
+  test::TestDevice device(j);
+  auto handler = BatteryModelDataHandler::init();
+  for (auto [chemID, type] : rows) EXPECT_EQ(handler->getDeviceType(chemID), type) << chemID;
+  EXPECT_EQ(device.logLines(), Lines{});
+}
+
+TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
+  struct Case {
+    json targetType;  // null: absent
+    std::optional<std::string> result;
+    Lines lines;
+  };
+  const Case cases[] = {
+      {"J42", "J42", {"debug " + kHandler + "Read HW type J42"}},
+      {{{"$data", "4a343200"}}, "J42", {"debug " + kHandler + "Read HW type J42"}},
+      // Raw bytes without a NUL still end at the value's size.
+      {{{"$data", "4a3432"}}, "J42", {"debug " + kHandler + "Read HW type J42"}},
+      {{{"$data", "4aff00"}}, std::nullopt, {"debug " + kHandler + "Read HW type J\xff"}},
+      {nullptr,
+       std::nullopt,
+       {"error " + kHandler + "hw.targettype size could not be read. Returned err -1"}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.targetType.dump());
+    json j = test::defaultDeviceJSON();
+    if (c.targetType.is_null())
+      j["sysctl"].erase("hw.targettype");
+    else
+      j["sysctl"]["hw.targettype"] = c.targetType;
+    test::TestDevice device(j);
+    auto handler = BatteryModelDataHandler::init();
+    for (uint32_t chemID : {0u, 5637u, 5650u, 5688u, 5690u, 6200u, 6440u}) {
+      device.clearLog();
+      EXPECT_EQ(handler->getDeviceType(chemID), c.result) << chemID;
+      EXPECT_EQ(device.logLines(), c.lines) << chemID;
+    }
+  }
+}
+
+TEST(ModelFilePath, DeviceTypeChemIDAndSuffixNameTheFile) {
+  struct Case {
+    json batteryData;
+    std::string relative;
+  };
+  const Case cases[] = {
+      {{{"AlgoChemID", 6439}}, "T618e/2168.rcmodel"},
+      {{{"AlgoChemID", 5640}, {"BatterySerialNumber", "0123456789ABCDE8"}}, "R72/1608b.rcmodel"},
+      {{{"AlgoChemID", 5640}, {"BatterySerialNumber", "0123456789ABCDE1"}}, "R72/1608a.rcmodel"},
+      {{{"AlgoChemID", 5640}}, "R72/1608.rcmodel"},
+      {{{"AlgoChemID", 1234}}, "T618e/4d2.rcmodel"},  // from hw.targettype
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.relative);
+    json j = test::defaultDeviceJSON();
+    j["registry"]["TesvarSmartBattery"]["BatteryData"] = c.batteryData;
+    test::TestDevice device(j);
+    auto handler = BatteryModelDataHandler::init();
+    uint32_t chemID = handler->getBatteryChemID();
+    EXPECT_EQ(handler->getBatteryModelFileURLString(chemID), std::nullopt);
+    device.installModel(c.relative, "");
+    EXPECT_EQ(handler->getBatteryModelFileURLString(chemID),
+              (device.dir() / "Library/KVR/BatteryModels" / c.relative).string());
+  }
+}
+
+TEST(ModelFile, OnlyTheFirstMessageIsUsed) {
+  test::TestDevice device;
+  auto first = std::make_shared<OTAParamRC>();
+  first->setChemID(1);
+  auto second = std::make_shared<OTAParamRC>();
+  second->setChemID(2);
+  device.installModel("T618e/2168.rcmodel", test::modelFile({first, second}));
+  auto handler = BatteryModelDataHandler::init();
+  auto model = handler->loadProtobufModelWithFileName(
+      (device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel").string());
+  ASSERT_TRUE(model);
+  EXPECT_EQ(model->chemID(), 1u);
+  EXPECT_FALSE(handler->loadProtobufModelWithFileName(std::nullopt));
+  EXPECT_EQ(
+      device.logLines(),
+      Lines{"error " + kHandler +
+            "-[BatteryModelDataHandler loadProtobufModelWithFileName:] <Error> fileName nil"});
+}
+
+TEST(PBStreamReader, FramingErrorsSayWhere) {
+  auto message = std::make_shared<OTAParamRC>();
+  message->setChemID(0x2168);
+  const std::string one = test::modelFile({message});
+  struct Case {
+    std::string bytes;
+    std::optional<size_t> count;
+    std::string error;
+  };
+  const Case cases[] = {
+      {"", 0, ""},
+      {one, 1, ""},
+      {one + one + one, 3, ""},
+      {std::string("\x00", 1), 1, ""},  // an empty message
+      {"\x80", std::nullopt, "the length of message 0 at offset 0 is cut short"},
+      {one + "\x81\x80", std::nullopt, "the length of message 1 at offset 5 is cut short"},
+      {"\x05\x90\x01", std::nullopt,
+       "message 0 at offset 0 claims 5 bytes but only 2 remain in "
+       "the file"},
+      {std::string("\x80\x80\x80\x80\x80\x80\x80\x80\x80\x01", 10), std::nullopt,
+       "message 0 at offset 0 claims 9223372036854775808 bytes but only 0 remain in the file"},
+      {std::string("\xff\xff\xff\xff\xff\xff\xff\xff\xff\x7f", 10), std::nullopt,
+       "the length of message 0 at offset 0 is not a valid varint"},
+      {one + "\x02\x90\x80", std::nullopt, "message 1 at offset 5 could not be decoded"},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(testing::PrintToString(c.bytes));
+    NSError error;
+    auto messages = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(
+        std::span<const uint8_t>(reinterpret_cast<const uint8_t*>(c.bytes.data()), c.bytes.size()),
+        &error);
+    ASSERT_EQ(messages.has_value(), c.count.has_value());
+    if (messages) {
+      EXPECT_EQ(messages->size(), *c.count);
+    }
+    EXPECT_EQ(error.localizedDescription, c.error);
+  }
+}
+
+TEST(PBStreamReader, RefusesWhatIsNotASmallRegularFile) {
+  char pattern[] = "/tmp/kolvrand-files.XXXXXX";
+  const fs::path dir = mkdtemp(pattern);
+  mkfifo((dir / "fifo").c_str(), 0600);
+  fs::create_symlink("loop", dir / "loop");
+  fs::create_directory(dir / "directory");
+  {
+    std::ofstream big(dir / "big", std::ios::binary);
+    big.seekp(PBStreamReader::kMaxFileSize);
+    big.put('\0');
+  }
+  const std::pair<const char*, std::string> cases[] = {
+      {"directory", "not a regular file"},
+      {"fifo", "not a regular file"},
+      {"loop", "cannot open: Too many levels of symbolic links"},
+      {"missing", "cannot open: No such file or directory"},
+      {"big", "4194305 bytes is larger than the 4194304-byte limit for a model file"},
+  };
+  for (const auto& [name, reason] : cases) {
+    SCOPED_TRACE(name);
+    NSError error;
+    EXPECT_FALSE(PBStreamReader::readFile((dir / name).string(), &error));
+    EXPECT_EQ(error.localizedDescription, (dir / name).string() + ": " + reason);
+  }
+  fs::remove_all(dir);
+}
+
+}  // namespace
+}  // namespace kolvrand
