@@ -78,10 +78,11 @@ class Dictionary {
   void set(std::string key, Value value);
   bool erase(std::string_view key);
 
-  size_t size() const { return entries_.size(); }
-  bool empty() const { return entries_.empty(); }
-  auto begin() const { return entries_.begin(); }
-  auto end() const { return entries_.end(); }
+  // Defined below Value, which the entries need complete.
+  size_t size() const;
+  bool empty() const;
+  std::vector<Entry>::const_iterator begin() const;
+  std::vector<Entry>::const_iterator end() const;
 
   // Equal when both hold the same keys with equal values, in any order.
   bool operator==(const Dictionary& other) const;
@@ -130,5 +131,18 @@ class Value {
  private:
   std::variant<bool, Number, std::string, Data, Array, Dictionary> v_;
 };
+
+inline size_t Dictionary::size() const {
+  return entries_.size();
+}
+inline bool Dictionary::empty() const {
+  return entries_.empty();
+}
+inline std::vector<Dictionary::Entry>::const_iterator Dictionary::begin() const {
+  return entries_.begin();
+}
+inline std::vector<Dictionary::Entry>::const_iterator Dictionary::end() const {
+  return entries_.end();
+}
 
 }  // namespace kolvrand
