@@ -1,204 +1,14 @@
+// printf-style formatting with %@ for objects.
 #include "platform/Log.h"
 
-#include <sys/stat.h>
-#include <sys/uio.h>
-#include <unistd.h>
-#define SD_JOURNAL_SUPPRESS_LOCATION
-#include <systemd/sd-journal.h>
-
-#include <cerrno>
 #include <cinttypes>
 #include <cmath>
 #include <cstdio>
-#include <cstdlib>
 #include <limits>
-#include <map>
-#include <mutex>
 
 namespace kolvrand {
 
 namespace {
-
-// ---- Which levels are enabled -------------------------------------------
-
-struct LevelConfig {
-  LogLevel fallback = LogLevel::Default;
-  std::map<std::string, LogLevel, std::less<>> categories;
-};
-
-struct LevelState {
-  std::mutex mutex;
-  LevelConfig config;
-  bool configured = false;  // set by setLogLevelSpec or the first os_log_create
-};
-
-// Never destroyed: logging stays usable while other statics are torn down.
-LevelState& levelState() {
-  static auto* s = new LevelState;
-  return *s;
-}
-
-std::string_view trim(std::string_view s) {
-  while (!s.empty() && (s.front() == ' ' || s.front() == '\t')) s.remove_prefix(1);
-  while (!s.empty() && (s.back() == ' ' || s.back() == '\t')) s.remove_suffix(1);
-  return s;
-}
-
-std::optional<LogLevel> parseLevel(std::string_view s) {
-  std::string lower;
-  for (char c : s) lower += static_cast<char>(c >= 'A' && c <= 'Z' ? c - 'A' + 'a' : c);
-  if (lower == "error") return LogLevel::Error;
-  if (lower == "default") return LogLevel::Default;
-  if (lower == "debug") return LogLevel::Debug;
-  return std::nullopt;
-}
-
-// Items apply in order: a bare level sets every category (earlier
-// per-category items included), CATEGORY=LEVEL sets one.
-LevelConfig parseLevels(std::string_view list) {
-  LevelConfig config;
-  while (!list.empty()) {
-    size_t comma = list.find(',');
-    std::string_view item = trim(list.substr(0, comma));
-    list = comma == std::string_view::npos ? std::string_view() : list.substr(comma + 1);
-    size_t eq = item.find('=');
-    if (eq == std::string_view::npos) {
-      if (auto level = parseLevel(item)) {
-        config.fallback = *level;
-        config.categories.clear();
-      }
-      continue;
-    }
-    std::string_view category = trim(item.substr(0, eq));
-    auto level = parseLevel(trim(item.substr(eq + 1)));
-    if (!category.empty() && level) config.categories[std::string(category)] = *level;
-  }
-  return config;
-}
-
-// ---- Sinks ----------------------------------------------------------------
-
-const char* levelName(LogLevel level) {
-  switch (level) {
-    case LogLevel::Error:
-      return "error";
-    case LogLevel::Default:
-      return "default";
-    case LogLevel::Debug:
-      return "debug";
-  }
-  return "default";
-}
-
-std::string_view withoutTrailingNewline(std::string_view message) {
-  if (!message.empty() && message.back() == '\n') message.remove_suffix(1);
-  return message;
-}
-
-void writeStderrLine(LogLevel level, std::string_view category, std::string_view message) {
-  // One write per line under a process-wide mutex: lines of different threads
-  // never interleave, and a line is never split by another process's output
-  // as long as it fits in a pipe buffer.
-  static auto* mutex = new std::mutex;
-  std::string line = "kolvrand[" + std::to_string(::getpid()) + "]: " + levelName(level) + " [";
-  line.append(category);
-  line += "] ";
-  size_t start = line.size();
-  line.append(withoutTrailingNewline(message));
-  // Keep one message on one line so that the output stays line-oriented.
-  for (size_t i = start; i < line.size(); ++i)
-    if (line[i] == '\n') line[i] = ' ';
-  line += '\n';
-  std::lock_guard lock(*mutex);
-  const char* p = line.data();
-  size_t left = line.size();
-  while (left > 0) {
-    ssize_t n = ::write(STDERR_FILENO, p, left);
-    if (n < 0) {
-      if (errno == EINTR) continue;
-      return;
-    }
-    p += n;
-    left -= static_cast<size_t>(n);
-  }
-}
-
-class StderrSink final : public LogSink {
- public:
-  void write(LogLevel level, std::string_view, std::string_view category,
-             std::string_view message) override {
-    writeStderrLine(level, category, message);
-  }
-};
-
-class JournalSink final : public LogSink {
- public:
-  void write(LogLevel level, std::string_view subsystem, std::string_view category,
-             std::string_view message) override {
-    const char* priority = level == LogLevel::Error     ? "PRIORITY=3"
-                           : level == LogLevel::Default ? "PRIORITY=5"
-                                                        : "PRIORITY=7";
-    std::string sub = "KOLVRAND_SUBSYSTEM=";
-    sub.append(subsystem);
-    std::string cat = "KOLVRAND_CATEGORY=";
-    cat.append(category);
-    std::string msg = "MESSAGE=";
-    msg.append(withoutTrailingNewline(message));
-    static const char identifier[] = "SYSLOG_IDENTIFIER=kolvrand";
-    auto iov = [](const void* p, size_t n) { return iovec{const_cast<void*>(p), n}; };
-    const iovec fields[] = {
-        iov(priority, std::char_traits<char>::length(priority)),
-        iov(identifier, sizeof identifier - 1),
-        iov(sub.data(), sub.size()),
-        iov(cat.data(), cat.size()),
-        iov(msg.data(), msg.size()),
-    };
-    if (sd_journal_sendv(fields, static_cast<int>(std::size(fields))) < 0)
-      writeStderrLine(level, category, message);
-  }
-};
-
-// systemd sets JOURNAL_STREAM to the device and inode of the stream it
-// connected stdout/stderr to; if fd 2 is still that stream, the journal gets
-// structured entries rather than bare lines. The native socket must exist
-// too: entries sent without it vanish without an error.
-bool stderrIsJournal() {
-  if (::access("/run/systemd/journal/socket", F_OK) != 0) return false;
-  const char* env = std::getenv("JOURNAL_STREAM");
-  if (!env) return false;
-  uintmax_t dev = 0, ino = 0;
-  char extra = 0;
-  if (std::sscanf(env, "%ju:%ju%c", &dev, &ino, &extra) != 2) return false;
-  struct stat st {};
-  if (::fstat(STDERR_FILENO, &st) != 0) return false;
-  return static_cast<uintmax_t>(st.st_dev) == dev && static_cast<uintmax_t>(st.st_ino) == ino;
-}
-
-struct SinkState {
-  std::mutex mutex;
-  std::shared_ptr<LogSink> installed;
-  std::shared_ptr<LogSink> standard;  // chosen once, at first use
-};
-
-SinkState& sinkState() {
-  static auto* s = new SinkState;
-  return *s;
-}
-
-std::shared_ptr<LogSink> currentSink() {
-  SinkState& s = sinkState();
-  std::lock_guard lock(s.mutex);
-  if (s.installed) return s.installed;
-  if (!s.standard) {
-    if (stderrIsJournal())
-      s.standard = std::make_shared<JournalSink>();
-    else
-      s.standard = std::make_shared<StderrSink>();
-  }
-  return s.standard;
-}
-
-// ---- Formatting -----------------------------------------------------------
 
 enum class Length { None, hh, h, l, ll, j, z, t, L };
 
@@ -362,40 +172,6 @@ int parseNumber(std::string_view format, size_t& i) {
 
 }  // namespace
 
-void setLogSink(std::shared_ptr<LogSink> sink) {
-  SinkState& s = sinkState();
-  std::lock_guard lock(s.mutex);
-  s.installed = std::move(sink);
-}
-
-void setLogLevelSpec(std::string_view levels) {
-  LevelState& s = levelState();
-  LevelConfig config = parseLevels(levels);
-  std::lock_guard lock(s.mutex);
-  s.config = std::move(config);
-  s.configured = true;
-}
-
-bool OSLog::enabled(LogLevel level) const {
-  LevelState& s = levelState();
-  std::lock_guard lock(s.mutex);
-  auto it = s.config.categories.find(category_);
-  LogLevel max = it != s.config.categories.end() ? it->second : s.config.fallback;
-  return static_cast<uint8_t>(level) <= static_cast<uint8_t>(max);
-}
-
-os_log_t os_log_create(const char* subsystem, const char* category) {
-  LevelState& s = levelState();
-  {
-    std::lock_guard lock(s.mutex);
-    if (!s.configured) {
-      s.configured = true;
-      if (const char* env = std::getenv("KOLVRAND_LOG_LEVEL")) s.config = parseLevels(env);
-    }
-  }
-  return std::make_shared<const OSLog>(subsystem ? subsystem : "", category ? category : "");
-}
-
 std::string formatLogMessage(std::string_view format, std::span<const LogArg> args) {
   std::string out;
   out.reserve(format.size() + 32);
@@ -541,12 +317,6 @@ std::string formatLogMessage(std::string_view format, std::span<const LogArg> ar
     }
   }
   return out;
-}
-
-void emitLog(const OSLog& log, LogLevel level, std::string_view format,
-             std::span<const LogArg> args) {
-  std::string message = formatLogMessage(format, args);
-  if (auto sink = currentSink()) sink->write(level, log.subsystem(), log.category(), message);
 }
 
 }  // namespace kolvrand

@@ -1,0 +1,153 @@
+// Where messages go: journald when stderr is the journal, else one line each on stderr.
+#include "platform/Log.h"
+
+#include <sys/stat.h>
+#include <sys/uio.h>
+#include <unistd.h>
+#define SD_JOURNAL_SUPPRESS_LOCATION
+#include <systemd/sd-journal.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <mutex>
+
+namespace kolvrand {
+
+namespace {
+
+const char* levelName(LogLevel level) {
+  switch (level) {
+    case LogLevel::Error:
+      return "error";
+    case LogLevel::Default:
+      return "default";
+    case LogLevel::Debug:
+      return "debug";
+  }
+  return "default";
+}
+
+std::string_view withoutTrailingNewline(std::string_view message) {
+  if (!message.empty() && message.back() == '\n') message.remove_suffix(1);
+  return message;
+}
+
+void writeStderrLine(LogLevel level, std::string_view category, std::string_view message) {
+  // One write per line under a process-wide mutex: lines of different threads
+  // never interleave, and a line is never split by another process's output
+  // as long as it fits in a pipe buffer.
+  static auto* mutex = new std::mutex;
+  std::string line = "kolvrand[" + std::to_string(::getpid()) + "]: " + levelName(level) + " [";
+  line.append(category);
+  line += "] ";
+  size_t start = line.size();
+  line.append(withoutTrailingNewline(message));
+  // Keep one message on one line so that the output stays line-oriented.
+  for (size_t i = start; i < line.size(); ++i)
+    if (line[i] == '\n') line[i] = ' ';
+  line += '\n';
+  std::lock_guard lock(*mutex);
+  const char* p = line.data();
+  size_t left = line.size();
+  while (left > 0) {
+    ssize_t n = ::write(STDERR_FILENO, p, left);
+    if (n < 0) {
+      if (errno == EINTR) continue;
+      return;
+    }
+    p += n;
+    left -= static_cast<size_t>(n);
+  }
+}
+
+class StderrSink final : public LogSink {
+ public:
+  void write(LogLevel level, std::string_view, std::string_view category,
+             std::string_view message) override {
+    writeStderrLine(level, category, message);
+  }
+};
+
+class JournalSink final : public LogSink {
+ public:
+  void write(LogLevel level, std::string_view subsystem, std::string_view category,
+             std::string_view message) override {
+    const char* priority = level == LogLevel::Error     ? "PRIORITY=3"
+                           : level == LogLevel::Default ? "PRIORITY=5"
+                                                        : "PRIORITY=7";
+    std::string sub = "KOLVRAND_SUBSYSTEM=";
+    sub.append(subsystem);
+    std::string cat = "KOLVRAND_CATEGORY=";
+    cat.append(category);
+    std::string msg = "MESSAGE=";
+    msg.append(withoutTrailingNewline(message));
+    static const char identifier[] = "SYSLOG_IDENTIFIER=kolvrand";
+    auto iov = [](const void* p, size_t n) { return iovec{const_cast<void*>(p), n}; };
+    const iovec fields[] = {
+        iov(priority, std::char_traits<char>::length(priority)),
+        iov(identifier, sizeof identifier - 1),
+        iov(sub.data(), sub.size()),
+        iov(cat.data(), cat.size()),
+        iov(msg.data(), msg.size()),
+    };
+    if (sd_journal_sendv(fields, static_cast<int>(std::size(fields))) < 0)
+      writeStderrLine(level, category, message);
+  }
+};
+
+// systemd sets JOURNAL_STREAM to the device and inode of the stream it
+// connected stdout/stderr to; if fd 2 is still that stream, the journal gets
+// structured entries rather than bare lines. The native socket must exist
+// too: entries sent without it vanish without an error.
+bool stderrIsJournal() {
+  if (::access("/run/systemd/journal/socket", F_OK) != 0) return false;
+  const char* env = std::getenv("JOURNAL_STREAM");
+  if (!env) return false;
+  uintmax_t dev = 0, ino = 0;
+  char extra = 0;
+  if (std::sscanf(env, "%ju:%ju%c", &dev, &ino, &extra) != 2) return false;
+  struct stat st {};
+  if (::fstat(STDERR_FILENO, &st) != 0) return false;
+  return static_cast<uintmax_t>(st.st_dev) == dev && static_cast<uintmax_t>(st.st_ino) == ino;
+}
+
+struct SinkState {
+  std::mutex mutex;
+  std::shared_ptr<LogSink> installed;
+  std::shared_ptr<LogSink> standard;  // chosen once, at first use
+};
+
+SinkState& sinkState() {
+  static auto* s = new SinkState;
+  return *s;
+}
+
+std::shared_ptr<LogSink> currentSink() {
+  SinkState& s = sinkState();
+  std::lock_guard lock(s.mutex);
+  if (s.installed) return s.installed;
+  if (!s.standard) {
+    if (stderrIsJournal())
+      s.standard = std::make_shared<JournalSink>();
+    else
+      s.standard = std::make_shared<StderrSink>();
+  }
+  return s.standard;
+}
+
+}  // namespace
+
+void setLogSink(std::shared_ptr<LogSink> sink) {
+  SinkState& s = sinkState();
+  std::lock_guard lock(s.mutex);
+  s.installed = std::move(sink);
+}
+
+void emitLog(const OSLog& log, LogLevel level, std::string_view format,
+             std::span<const LogArg> args) {
+  std::string message = formatLogMessage(format, args);
+  if (auto sink = currentSink()) sink->write(level, log.subsystem(), log.category(), message);
+}
+
+}  // namespace kolvrand
