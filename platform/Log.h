@@ -37,10 +37,10 @@ void setLogSink(std::shared_ptr<LogSink> sink);
 // for all categories ("debug"), or a comma list of CATEGORY=LEVEL and LEVEL
 // items, later items winning ("default,main=debug"). Levels: error, default,
 // debug; each enables itself and the levels above it. Unknown items are
-// ignored. An empty spec restores the default (error and default enabled).
+// ignored. An empty list restores the default (error and default enabled).
 // The environment variable is read once, at the first log created, unless
 // this was called before.
-void setLogLevelSpec(std::string_view spec);
+void setLogLevelSpec(std::string_view levels);
 
 class OSLog {
  public:
