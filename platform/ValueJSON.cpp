@@ -13,7 +13,14 @@ bool fail(std::string* error, std::string what) {
   return false;
 }
 
-bool convert(const JSON& j, Value& out, const std::string& where, std::string* error) {
+// Deeper values are refused: conversion recurses once per level, and a
+// device file must not be able to exhaust the stack of the thread reading it.
+constexpr int kMaxDepth = 64;
+
+bool convert(const JSON& j, Value& out, const std::string& where, std::string* error,
+             int depth = 0) {
+  if ((j.is_array() || j.is_object()) && depth == kMaxDepth)
+    return fail(error, where + ": nested more than " + std::to_string(kMaxDepth) + " deep");
   switch (j.type()) {
     case JSON::value_t::boolean:
       out = Value(j.get<bool>());
@@ -39,7 +46,8 @@ bool convert(const JSON& j, Value& out, const std::string& where, std::string* e
       a.reserve(j.size());
       for (size_t i = 0; i < j.size(); ++i) {
         Value v;
-        if (!convert(j[i], v, where + "[" + std::to_string(i) + "]", error)) return false;
+        if (!convert(j[i], v, where + "[" + std::to_string(i) + "]", error, depth + 1))
+          return false;
         a.push_back(std::move(v));
       }
       out = Value(std::move(a));
@@ -57,7 +65,7 @@ bool convert(const JSON& j, Value& out, const std::string& where, std::string* e
       Dictionary d;
       for (auto it = j.begin(); it != j.end(); ++it) {
         Value v;
-        if (!convert(it.value(), v, where + "." + it.key(), error)) return false;
+        if (!convert(it.value(), v, where + "." + it.key(), error, depth + 1)) return false;
         d.set(it.key(), std::move(v));
       }
       out = Value(std::move(d));

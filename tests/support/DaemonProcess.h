@@ -26,7 +26,10 @@ inline std::filesystem::path daemonBinary() {
 
 class DaemonProcess {
  public:
-  DaemonProcess(const std::filesystem::path& device, const std::string& logLevel = "debug")
+  // `launcher`, when given, is a command that runs the daemon in its place
+  // (its first word an absolute path), such as setpriv to drop privileges.
+  DaemonProcess(const std::filesystem::path& device, const std::string& logLevel = "debug",
+                std::vector<std::string> launcher = {})
       : stderrPath_(device / "daemon.stderr") {
     std::vector<std::string> env;
     for (char** e = environ; *e; ++e) {
@@ -45,9 +48,11 @@ class DaemonProcess {
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_addopen(&actions, 2, stderrPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
                                      0644);
-    std::string binary = daemonBinary().string();
-    char* argv[] = {binary.data(), nullptr};
-    running_ = posix_spawn(&pid_, binary.c_str(), &actions, nullptr, argv, envp.data()) == 0;
+    launcher.push_back(daemonBinary().string());
+    std::vector<char*> argv;
+    for (auto& s : launcher) argv.push_back(s.data());
+    argv.push_back(nullptr);
+    running_ = posix_spawn(&pid_, argv[0], &actions, nullptr, argv.data(), envp.data()) == 0;
     posix_spawn_file_actions_destroy(&actions);
   }
   ~DaemonProcess() {
