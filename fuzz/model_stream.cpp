@@ -52,8 +52,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   auto again = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(
       std::span<const uint8_t>(rewritten), &error);
   check(again && again->size() == messages->size());
+  // Bytes, not dictionaries: a write is exact, and comparing dictionaries of
+  // full-size models would dominate the run time.
   for (size_t i = 0; i < messages->size(); ++i)
-    check((*again)[i]->dictionaryRepresentation() == (*messages)[i]->dictionaryRepresentation());
+    check((*again)[i]->data() == (*messages)[i]->data());
 
   if (messages->empty()) return 0;
   static const auto handler = [] {
