@@ -8,10 +8,6 @@
 
 namespace kolvrand {
 
-namespace {
-
-// The kernel's boot-session UUID, or nullopt when it cannot be read or is not
-// UTF-8.
 std::optional<std::string> currentBootSessionUUID() {
   size_t size = 0;
   if (sysctlbyname("kern.bootsessionuuid", nullptr, &size, nullptr, 0) != 0) return std::nullopt;
@@ -21,8 +17,6 @@ std::optional<std::string> currentBootSessionUUID() {
     return std::nullopt;
   return stringWithUTF8String(buffer.data());
 }
-
-}  // namespace
 
 void runBatteryModelTask(const os_log_t& mainLog, BatteryModelDataHandler* handler) {
   // Its own defaults object, not the handler's.

@@ -3,10 +3,17 @@
 // "savedBootUUID" only after a successful upload.
 #pragma once
 
+#include <optional>
+#include <string>
+
 #include "pipeline/BatteryModelDataHandler.h"
 #include "platform/Log.h"
 
 namespace kolvrand {
+
+// The kernel's boot-session UUID, or nullopt when it cannot be read or is not
+// UTF-8.
+std::optional<std::string> currentBootSessionUUID();
 
 // Runs once per process start on the battery-model queue. `handler` may be
 // nil: the chem ID is then 0 and the upload reports false.

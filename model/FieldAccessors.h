@@ -131,8 +131,9 @@
 #define KVR_FLOAT_ROW(number, name, Name, key, bit)                                            \
   ::kolvrand::detail::field(number, ::kolvrand::detail::FieldKind::OptionalFloat, Slots::name, \
                             #name, key, bit),
-#define KVR_ENUM_ROW(number, name, Name, key, bit) \
-  ::kolvrand::detail::optionalEnumField(number, Slots::name, #name, key, bit, &name##AsString),
+#define KVR_ENUM_ROW(number, name, Name, key, bit)                                             \
+  ::kolvrand::detail::optionalEnumField(number, Slots::name, #name, key, bit, &name##AsString, \
+                                        &StringAs##Name),
 
 // Defines Class::table(): the rows of FIELDS, checked at compile time, with
 // the field-number index built from them.

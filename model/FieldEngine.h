@@ -11,6 +11,10 @@
 #include "model/PBDataWriter.h"
 #include "platform/Value.h"
 
+namespace kolvrand {
+struct DictionaryError;
+}
+
 namespace kolvrand::detail {
 
 // The read function: decodes fields up to the reader's limit. Known fields are
@@ -34,5 +38,11 @@ void mergeFields(const MessageTable& table, ConstFields from, MutableFields to);
 bool equalFields(const MessageTable& table, ConstFields a, ConstFields b);
 uint64_t hashFields(const MessageTable& table, ConstFields fields);
 Value dictionaryOfFields(const MessageTable& table, ConstFields fields);
+// The reverse of dictionaryOfFields, by the same keys and kinds: floats from
+// any number that rounds to a finite float (or is NaN or infinite already),
+// chemID-like fields from integral numbers in range, enums from their names,
+// "(unknown: N)" or a 32-bit integer.
+bool setFieldsFromDictionary(const MessageTable& table, MutableFields fields,
+                             const Value& dictionary, DictionaryError* error);
 
 }  // namespace kolvrand::detail

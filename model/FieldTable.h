@@ -7,7 +7,9 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <string>
+#include <string_view>
 
 #include "model/Wire.h"
 
@@ -38,6 +40,8 @@ struct FieldDescriptor {
   const char* key = "";   // the dictionary key
   std::shared_ptr<PBCodable> (*makeMessage)() = nullptr;  // SubMessage: a new, empty instance
   std::string (*enumName)(int32_t) = nullptr;             // OptionalEnum: its dictionary form
+  // OptionalEnum: the value a name stands for (0 for a string that names none).
+  int32_t (*enumValue)(std::optional<std::string_view>) = nullptr;
 
   constexpr uint32_t hasMask() const { return uint32_t{1} << hasBit; }
   constexpr bool hasPresenceBit() const {
@@ -85,9 +89,11 @@ constexpr FieldDescriptor subMessageField(uint32_t number, uint8_t slot, const c
 
 constexpr FieldDescriptor optionalEnumField(uint32_t number, uint8_t slot, const char* name,
                                             const char* key, uint8_t hasBit,
-                                            std::string (*enumName)(int32_t)) {
+                                            std::string (*enumName)(int32_t),
+                                            int32_t (*enumValue)(std::optional<std::string_view>)) {
   FieldDescriptor d = field(number, FieldKind::OptionalEnum, slot, name, key, hasBit);
   d.enumName = enumName;
+  d.enumValue = enumValue;
   return d;
 }
 

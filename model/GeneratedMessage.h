@@ -40,6 +40,16 @@ class GeneratedMessage : public PBCodable {
   Value dictionaryRepresentation() const override {
     return dictionaryOfFields(Derived::table(), fields_.view());
   }
+  bool setFieldsFromDictionary(const Value& dictionary, DictionaryError* error) override {
+    return detail::setFieldsFromDictionary(Derived::table(), fields_.view(), dictionary, error);
+  }
+  // A new message from its dictionary form; nullptr with *error filled when
+  // setFieldsFromDictionary fails.
+  static std::shared_ptr<Derived> fromDictionary(const Value& dictionary, DictionaryError* error) {
+    auto message = std::make_shared<Derived>();
+    if (!message->setFieldsFromDictionary(dictionary, error)) return nullptr;
+    return message;
+  }
 
   // The target shares this message's sub-messages (a later change through
   // either parent shows in both); see copyFields.

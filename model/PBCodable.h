@@ -14,6 +14,14 @@
 
 namespace kolvrand {
 
+// Why a dictionary could not be taken into a message, and where: `path` is the
+// keys from the message down, joined by '.', with list positions as "[i]"
+// ("R0.resistance25C[3]"); empty for the dictionary itself.
+struct DictionaryError {
+  std::string path;
+  std::string reason;
+};
+
 class PBCodable {
  public:
   PBCodable() = default;
@@ -37,6 +45,12 @@ class PBCodable {
   // Equal messages hash alike.
   virtual uint64_t hash() const = 0;
   virtual Value dictionaryRepresentation() const = 0;
+  // The reverse of dictionaryRepresentation(): each key sets its field (a
+  // list or sub-message is replaced whole); fields whose keys are absent stay
+  // as they are. An unknown key, a value of the wrong type or one out of range
+  // fails with *error filled; the message is then partly set and should be
+  // dropped.
+  virtual bool setFieldsFromDictionary(const Value& dictionary, DictionaryError* error) = 0;
   // The base description ("<Class: 0x...>"), a space, and the dictionary.
   virtual std::string description() const;
 

@@ -32,6 +32,9 @@ class BatteryModelDataHandler {
   // Device type and model file.
   std::optional<std::string> getDeviceType(uint32_t chemID);
   std::optional<std::string> getBatteryModelFileURLString(uint32_t chemID);
+  // Where getBatteryModelFileURLString looks, whether or not a file is there;
+  // nil (logged under that method's name) without a device type or Library.
+  std::optional<std::string> getBatteryModelFilePath(uint32_t chemID);
   std::shared_ptr<OTAParamRC> loadProtobufModelWithFileName(
       const std::optional<std::string>& fileName);
 

@@ -8,8 +8,13 @@
 
 namespace kolvrand {
 
-std::optional<std::string> BatteryModelDataHandler::getBatteryModelFileURLString(uint32_t chemID) {
-  static constexpr const char* kMethod = "-[BatteryModelDataHandler getBatteryModelFileURLString:]";
+namespace {
+constexpr const char* kFileURLMethod = "-[BatteryModelDataHandler getBatteryModelFileURLString:]";
+}
+
+// The first half of getBatteryModelFileURLString, so its lines carry that name.
+std::optional<std::string> BatteryModelDataHandler::getBatteryModelFilePath(uint32_t chemID) {
+  static constexpr const char* kMethod = kFileURLMethod;
   NSFileManager& fileManager = NSFileManager::defaultManager();
 
   std::optional<std::string> deviceType = getDeviceType(chemID);
@@ -30,11 +35,17 @@ std::optional<std::string> BatteryModelDataHandler::getBatteryModelFileURLString
   std::snprintf(fileName, sizeof fileName, "%x", chemID);
   const NSURL url = *workingDirURL / "KVR" / "BatteryModels" / *deviceType /
                     (std::string(fileName) + suffix + ".rcmodel");
-  std::string path = url.string();
+  return url.string();
+}
 
-  os_log_debug(log_, "%s workingDirURL resource: %@ \n", kMethod, path);
-  if (!fileManager.fileExistsAtPath(path)) {
-    os_log_error(log_, "%s <Error> file not present: %@", kMethod, path);
+std::optional<std::string> BatteryModelDataHandler::getBatteryModelFileURLString(uint32_t chemID) {
+  static constexpr const char* kMethod = kFileURLMethod;
+  std::optional<std::string> path = getBatteryModelFilePath(chemID);
+  if (!path) return std::nullopt;
+
+  os_log_debug(log_, "%s workingDirURL resource: %@ \n", kMethod, *path);
+  if (!NSFileManager::defaultManager().fileExistsAtPath(*path)) {
+    os_log_error(log_, "%s <Error> file not present: %@", kMethod, *path);
     return std::nullopt;
   }
   return path;

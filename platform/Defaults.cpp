@@ -21,6 +21,7 @@ struct NSUserDefaults::Suite {
   std::filesystem::path path;      // STATE/SUITE.json
   std::filesystem::path lockPath;  // STATE/SUITE.json.lock
   std::mutex mutex;                // orders this process's reads and writes
+  bool readOnly = false;           // opened by openExistingSuiteNamed: never written
 };
 
 namespace {
@@ -33,8 +34,10 @@ const os_log_t& defaultsLog() {
 // rename at every write, so it cannot carry the lock.
 class FileLock {
  public:
-  FileLock(const std::filesystem::path& path, int operation) {
-    fd_ = ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+  // Without `create`, a missing lock file is not made and nothing is locked.
+  FileLock(const std::filesystem::path& path, int operation, bool create = true) {
+    fd_ = create ? ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600)
+                 : ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
     if (fd_ < 0) {
       error_ = errno;
       return;
@@ -133,6 +136,24 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(
   return std::make_shared<NSUserDefaults>(std::move(shared));
 }
 
+std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(std::string_view suite) {
+  return openExistingSuiteNamed(suite, platform::backend().stateDirectory());
+}
+
+std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(
+    std::string_view suite, const std::filesystem::path& dir) {
+  if (!validSuiteName(suite)) return nullptr;
+  std::error_code ec;
+  std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
+  if (ec) absolute = dir;
+  auto shared = std::make_shared<Suite>();
+  shared->path = (absolute / (std::string(suite) + ".json")).lexically_normal();
+  shared->lockPath = shared->path.string() + ".lock";
+  shared->readOnly = true;
+  if (!std::filesystem::is_regular_file(shared->path, ec)) return nullptr;
+  return std::make_shared<NSUserDefaults>(std::move(shared));
+}
+
 namespace {
 
 // The current content under a shared lock, so a read never overlaps another
@@ -140,7 +161,7 @@ namespace {
 // file is read as is; renames keep it whole either way.
 JSON load(NSUserDefaults::Suite& s) {
   std::lock_guard lock(s.mutex);
-  FileLock fileLock(s.lockPath, LOCK_SH);
+  FileLock fileLock(s.lockPath, LOCK_SH, !s.readOnly);
   return readSuite(s.path);
 }
 
@@ -148,6 +169,11 @@ JSON load(NSUserDefaults::Suite& s) {
 // processes never lose each other's keys.
 template <typename F>
 bool update(NSUserDefaults::Suite& s, std::string_view key, F&& modify) {
+  if (s.readOnly) {
+    os_log_error(defaultsLog(), "%s is open for reading only; %s not written\n", s.path.string(),
+                 key);
+    return false;
+  }
   std::lock_guard lock(s.mutex);
   FileLock fileLock(s.lockPath, LOCK_EX);
   if (!fileLock.locked()) {

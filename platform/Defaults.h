@@ -24,6 +24,13 @@ class NSUserDefaults {
   static std::shared_ptr<NSUserDefaults> initWithSuiteName(std::string_view suite,
                                                            const std::filesystem::path& dir);
 
+  // An existing suite, for reading only: nil when its file does not exist or
+  // the name is no file name. Nothing is created, not even a lock file, and
+  // every set returns false.
+  static std::shared_ptr<NSUserDefaults> openExistingSuiteNamed(std::string_view suite);
+  static std::shared_ptr<NSUserDefaults> openExistingSuiteNamed(std::string_view suite,
+                                                                const std::filesystem::path& dir);
+
   // An absent key, or a value of another type, reads as nil, 0 or false.
   std::optional<std::string> stringForKey(std::string_view key) const;
   int64_t integerForKey(std::string_view key) const;

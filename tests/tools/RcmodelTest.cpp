@@ -1,0 +1,387 @@
+// The rcmodel binary as scripts drive it: round trips through JSON, exit codes
+// and messages, the record's digest against the daemon's upload, validate,
+// plot, and status on simulated devices.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <regex>
+#include <span>
+
+#include "daemon/BatteryModelTask.h"
+#include "model/OTAParamRC.h"
+#include "pipeline/DaemonIdentifier.h"
+#include "pipeline/KextBatteryModel.h"
+#include "pipeline/PBStreamWriter.h"
+#include "platform/CommonCrypto.h"
+#include "tests/support/ModelFiles.h"
+#include "tests/support/TestDevice.h"
+#include "tests/tools/RandomModel.h"
+#include "tests/tools/RunTool.h"
+#include "tools/rcmodel/ModelJSON.h"
+
+namespace kolvrand {
+namespace {
+
+namespace fs = std::filesystem;
+using test::readWhole;
+using test::Scratch;
+using test::ToolRun;
+using test::writeWhole;
+
+std::string hex(const SHA1Digest& digest) {
+  static const char* digits = "0123456789abcdef";
+  std::string out;
+  for (uint8_t b : digest) out += {digits[b >> 4], digits[b & 15]};
+  return out;
+}
+
+std::string sha1Hex(const std::string& bytes) {
+  return hex(sha1(bytes.data(), bytes.size()));
+}
+
+std::string exampleModelFile(uint32_t chemID = 0x2168) {
+  return test::modelFile({makeExampleModel(chemID)});
+}
+
+std::vector<std::string> lines(const std::string& text) {
+  std::vector<std::string> out;
+  std::istringstream in(text);
+  for (std::string line; std::getline(in, line);) out.push_back(line);
+  return out;
+}
+
+TEST(Rcmodel, RandomModelsRoundTripThroughJSON) {
+  Scratch scratch;
+  test::RandomModels random(5);
+  for (int round = 0; round < 4; ++round) {
+    SCOPED_TRACE(round);
+    // One to three messages per file, as an array.
+    std::vector<std::string> objects;
+    std::vector<std::shared_ptr<OTAParamRC>> models;
+    for (size_t i = 0, n = 1 + random.pick(3); i < n; ++i) {
+      Value dictionary = random.next();
+      objects.push_back(rcmodel::renderJSON(dictionary));
+      models.push_back(OTAParamRC::fromDictionary(dictionary, nullptr));
+      ASSERT_TRUE(models.back());
+    }
+    std::string array = "[\n";
+    for (size_t i = 0; i < objects.size(); ++i) array += (i ? ",\n" : "") + objects[i];
+    writeWhole(scratch / "model.json", array + "\n]\n");
+
+    ToolRun encode = scratch.rcmodel({"encode", "model.json", "-o", "model.rcmodel"});
+    ASSERT_EQ(encode.status, 0) << encode.err;
+    EXPECT_EQ(encode.out, "");
+    // Encode of the dictionary gives the same message the daemon's writer does.
+    EXPECT_EQ(readWhole(scratch / "model.rcmodel"), test::modelFile(models));
+
+    // Decode of encode is the identity on the JSON.
+    ToolRun decode = scratch.rcmodel({"decode", "model.rcmodel"});
+    ASSERT_EQ(decode.status, 0) << decode.err;
+    EXPECT_EQ(lines(decode.out), objects);
+
+    // The same for one bare message, through stdin and stdout.
+    ToolRun raw = scratch.rcmodel({"encode", "--raw", "-", "-o", "-"}, objects[0]);
+    ASSERT_EQ(raw.status, 0) << raw.err;
+    const std::vector<uint8_t> bare = models[0]->data();
+    EXPECT_EQ(raw.out, std::string(bare.begin(), bare.end()));
+    ToolRun rawDecode = scratch.rcmodel({"decode", "--raw", "-"}, raw.out);
+    ASSERT_EQ(rawDecode.status, 0) << rawDecode.err;
+    EXPECT_EQ(rawDecode.out, objects[0] + "\n");
+  }
+}
+
+TEST(Rcmodel, EncodeOfDecodeGivesTheSameFile) {
+  Scratch scratch;
+  for (const char* example :
+       {"examples/models/R72/1608a.rcmodel", "examples/models/K517/1821.rcmodel"}) {
+    const fs::path file = fs::path(KOLVRAND_SOURCE_DIR) / example;
+    ToolRun decode = scratch.rcmodel({"decode", file.string()});
+    ASSERT_EQ(decode.status, 0) << decode.err;
+    ToolRun encode = scratch.rcmodel({"encode", "-", "-o", "again.rcmodel"}, decode.out);
+    ASSERT_EQ(encode.status, 0) << encode.err;
+    EXPECT_EQ(readWhole(scratch / "again.rcmodel"), readWhole(file)) << example;
+  }
+}
+
+// What each wrong use prints and returns. Files named here are made by the
+// test: "good" is a full model, "cut" the same cut short, "short" a model the
+// record builder refuses, "empty" an empty file.
+TEST(Rcmodel, ExitCodesAndMessages) {
+  Scratch scratch;
+  const std::string good = exampleModelFile();
+  writeWhole(scratch / "good.rcmodel", good);
+  writeWhole(scratch / "cut.rcmodel", good.substr(0, good.size() / 2));
+  auto shortModel = makeExampleModel(0x2168);
+  shortModel->setR0(nullptr);
+  writeWhole(scratch / "short.rcmodel", test::modelFile({shortModel}));
+  writeWhole(scratch / "empty.rcmodel", "");
+  writeWhole(scratch / "bad.json", "{\"chemID\": 1, \"gridOCV\": [0.5, \"high\"]}");
+
+  struct Case {
+    std::vector<std::string> args;
+    std::string input;
+    int status;
+    std::string err;  // a regular expression stderr must match, "" for empty stderr
+    std::string out;  // a regular expression stdout must match
+  } const cases[] = {
+      {{}, "", 2, "usage: rcmodel COMMAND", ""},
+      {{"--help"}, "", 0, "", "usage: rcmodel COMMAND[\\s\\S]*decode[\\s\\S]*status"},
+      {{"frobnicate"}, "", 2, "^rcmodel: unknown command \"frobnicate\"; run rcmodel --help", ""},
+      {{"decode"},
+       "",
+       2,
+       "^rcmodel decode: give one model file.*; see rcmodel decode --help\n$",
+       ""},
+      {{"decode", "--bogus", "good.rcmodel"}, "", 2, "unknown option --bogus", ""},
+      {{"decode", "missing.rcmodel"}, "", 1, "missing.rcmodel: cannot open: No such file", "^$"},
+      {{"decode", "cut.rcmodel"},
+       "",
+       1,
+       "^rcmodel decode: cut.rcmodel: message 0 at offset 0 claims [0-9]+ bytes but only [0-9]+ "
+       "remain in the file; if it holds one bare message without its length, use --raw\n$",
+       "^$"},
+      {{"decode", "empty.rcmodel"}, "", 0, "", "^$"},
+      {{"encode", "bad.json"}, "", 2, "give the model file to write with -o FILE", ""},
+      {{"encode", "bad.json", "-o", "out.rcmodel"},
+       "",
+       2,
+       "^rcmodel encode: bad.json: \\$.gridOCV\\[1\\]: expected a float, got the string \"high\" "
+       "\\(NaN and the infinities are written \"NaN\", \"Infinity\", \"-Infinity\"\\); nothing was "
+       "written\n$",
+       "^$"},
+      {{"encode", "--raw", "-", "-o", "out.rcmodel"},
+       "[{}, {}]",
+       2,
+       "stdin: \\$: expected one object",
+       "^$"},
+      {{"encode", "nothere.json", "-o", "out.rcmodel"}, "", 2, "nothere.json: cannot open", ""},
+      {{"record"}, "", 2, "give one model file", ""},
+      {{"record", "good.rcmodel"}, "", 0, "", "^[0-9a-f]{40}\n$"},
+      {{"record", "short.rcmodel", "-o", "out.bin"},
+       "",
+       1,
+       "^rcmodel record: -\\[BatteryModelDataHandler createKextModelFromProtobufModel:\\] <Error> "
+       "r0 nil: the record needs all 17 resistance tables\nrcmodel record: short.rcmodel: the "
+       "daemon would refuse this model \\(see above\\); rcmodel validate short.rcmodel lists",
+       "^$"},
+      {{"record", "empty.rcmodel"},
+       "",
+       1,
+       "protobufModelRCParams nil\nrcmodel record: empty.rcmodel: the daemon cannot load this file",
+       "^$"},
+      {{"validate"}, "", 2, "give at least one model file", ""},
+      {{"validate", "good.rcmodel", "short.rcmodel", "cut.rcmodel"},
+       "",
+       1,
+       "cut.rcmodel: message 0",
+       "good.rcmodel\n[\\s\\S]*ok: the daemon would load it[\\s\\S]*\n\nshort.rcmodel\n[\\s\\S]*r0 "
+       "+- +- +MISSING"
+       "[\\s\\S]*refused[\\s\\S]*\n\ncut.rcmodel\n  decodes: no"},
+      {{"plot", "good.rcmodel"}, "", 2, "give the picture to write with -o OUT.svg", ""},
+      {{"plot", "cut.rcmodel", "-o", "out.svg"}, "", 1, "cut.rcmodel: message 0", "^$"},
+      {{"status", "extra"}, "", 2, "status takes no file", ""},
+  };
+  for (const Case& c : cases) {
+    std::string command;
+    for (const auto& a : c.args) command += a + " ";
+    SCOPED_TRACE(command);
+    ToolRun run = scratch.rcmodel(c.args, c.input);
+    EXPECT_EQ(run.status, c.status) << run.err;
+    if (c.err.empty())
+      EXPECT_EQ(run.err, "");
+    else
+      EXPECT_TRUE(std::regex_search(run.err, std::regex(c.err))) << run.err;
+    EXPECT_TRUE(std::regex_search(run.out, std::regex(c.out))) << run.out;
+    // Nothing is written on failure.
+    if (c.status != 0) {
+      EXPECT_FALSE(fs::exists(scratch / "out.rcmodel"));
+      EXPECT_FALSE(fs::exists(scratch / "out.bin"));
+      EXPECT_FALSE(fs::exists(scratch / "out.svg"));
+    }
+  }
+  for (const char* command : {"decode", "encode", "record", "validate", "plot", "status"}) {
+    ToolRun help = scratch.rcmodel({command, "--help"});
+    EXPECT_EQ(help.status, 0) << command;
+    EXPECT_TRUE(help.out.starts_with(std::string("usage: rcmodel ") + command)) << help.out;
+  }
+}
+
+TEST(Rcmodel, RawDecodePrintsWhatWasReadBeforeTheBreak) {
+  Scratch scratch;
+  OTAParamRC model;
+  model.setChemID(0x2168);
+  model.setMaxRdcRatio(2.5f);
+  model.addGridOCV(3.7f);
+  std::vector<uint8_t> bytes = model.data();
+  // A fixed32 float field (21, maxRdcRatio) whose value breaks off.
+  bytes.insert(bytes.end(), {0xad, 0x01, 0x00, 0x00});
+  writeWhole(scratch / "bare.bin", std::string(bytes.begin(), bytes.end()));
+  ToolRun run = scratch.rcmodel({"decode", "--raw", "bare.bin"});
+  EXPECT_EQ(run.status, 1);
+  EXPECT_NE(run.out.find("\"chemID\":8552"), std::string::npos) << run.out;
+  EXPECT_NE(run.out.find("\"gridOCV\":[3.7]"), std::string::npos) << run.out;
+  EXPECT_TRUE(std::regex_search(run.err, std::regex("bare.bin: the message breaks off at byte "
+                                                    "[0-9]+ of " +
+                                                    std::to_string(bytes.size()))))
+      << run.err;
+}
+
+// The digest `record` prints is the one the daemon's upload leaves in the
+// driver, and -o writes the very bytes the driver received.
+TEST(Rcmodel, RecordIsWhatTheDaemonUploads) {
+  for (uint32_t chemID : {0x2168u, 0x1608u}) {
+    test::TestDevice device;
+    auto model = makeExampleModel(chemID);
+    device.installModel("T618e/2168.rcmodel", test::modelFile({model}));
+    runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
+                        BatteryModelDataHandler::init().get());
+    const std::string uploaded = readWhole(device.dir() / "driver/battery_params.bin");
+    ASSERT_EQ(uploaded.size(), 29056u);
+
+    const std::string file =
+        (device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel").string();
+    Scratch scratch;
+    ToolRun run = scratch.rcmodel({"record", file, "-o", "record.bin"});
+    ASSERT_EQ(run.status, 0) << run.err;
+    EXPECT_EQ(run.out, sha1Hex(uploaded) + "\n");
+    EXPECT_EQ(readWhole(scratch / "record.bin"), uploaded);
+  }
+}
+
+// Every file list in the record is reported against the record's count.
+TEST(Rcmodel, ValidateReportsEveryListAgainstTheRecord) {
+  Scratch scratch;
+  auto model = makeExampleModel(0x2168);
+  std::vector<float> grid(model->gridOCVs(), model->gridOCVs() + model->gridOCVsCount());
+  model->setGridOCVs(grid.data(), 300);
+  std::vector<float> aging(110, 1e-4f);
+  model->setAgingCoeffForR1s(aging.data(), aging.size());
+  model->setRCFreq4(nullptr);
+  model->setHasMLBConfig(false);
+  writeWhole(scratch / "m.rcmodel", test::modelFile({model, model}));
+  ToolRun run = scratch.rcmodel({"validate", "m.rcmodel"});
+  EXPECT_EQ(run.status, 1);
+  const std::string expected[] = {
+      "decodes: yes, 2 messages; the daemon uses the first",
+      "gridOCVs +300 +303  SHORT: 3 missing, the daemon refuses this",
+      "agingCoeffForR1s +110 +102  8 beyond the record, dropped",
+      "rCFreq4 +- +-  MISSING: the record needs all 17 resistance tables",
+      "r0.resistance25Cs +51 +51  ok",
+      "r0.temperatureCoeffs +153 +153  ok",
+      "note: MLBConfig not set; the record carries 0",
+      "refused: the daemon would not load this model",
+  };
+  for (const std::string& text : expected)
+    EXPECT_TRUE(std::regex_search(run.out, std::regex(text))) << text << "\n" << run.out;
+  // One row per resistance-table list and per model list.
+  EXPECT_EQ(std::count(run.out.begin(), run.out.end(), '\n'), 1 + 1 + 1 + 16 * 2 + 1 + 22 + 1 + 1);
+}
+
+TEST(Rcmodel, PlotDrawsTheGridAndEveryTable) {
+  Scratch scratch;
+  auto model = makeExampleModel(0x2168);
+  model->setBaselineR4(nullptr);
+  writeWhole(scratch / "m.rcmodel", test::modelFile({model}));
+  ToolRun run = scratch.rcmodel({"plot", "m.rcmodel", "-o", "m.svg"});
+  ASSERT_EQ(run.status, 0) << run.err;
+  const std::string svg = readWhole(scratch / "m.svg");
+  EXPECT_TRUE(svg.starts_with("<?xml")) << svg.substr(0, 100);
+  EXPECT_TRUE(svg.ends_with("</svg>\n"));
+  auto count = [&](const std::string& what) {
+    size_t n = 0;
+    for (size_t at = svg.find(what); at != std::string::npos; at = svg.find(what, at + 1)) ++n;
+    return n;
+  };
+  // Three OCV bands; for 16 tables, one resistance curve and three bands.
+  EXPECT_EQ(count("<polyline"), 3u + 16u * 4u);
+  EXPECT_EQ(count("temperature band "), 3u);
+  EXPECT_EQ(count(">missing: the daemon refuses the model<"), 1u);
+  EXPECT_EQ(count("<text"), count("</text>"));
+}
+
+// The verdict through a device's life, and that status never writes.
+TEST(Rcmodel, StatusFollowsTheDaemon) {
+  test::TestDevice device;
+  const std::string modelPath = "T618e/2168.rcmodel";
+  device.installModel(modelPath, exampleModelFile());
+  Scratch scratch;
+  auto status = [&] {
+    ToolRun run = scratch.rcmodel({"status"}, "", device.dir().string());
+    EXPECT_EQ(run.status, 0) << run.err;
+    EXPECT_EQ(run.err, "");
+    return run.out;
+  };
+  auto field = [](const std::string& report, const std::string& key) {
+    std::smatch m;
+    std::regex_search(report, m, std::regex("(^|\n)" + key + ": +([^\n]*)"));
+    return m.size() > 2 ? m[2].str() : "(no " + key + ")";
+  };
+  const std::string recordHash = sha1Hex([&] {
+    // A handler without defaults, which leaves the state directory alone.
+    auto record =
+        BatteryModelDataHandler().createKextModelFromProtobufModel(makeExampleModel(0x2168).get());
+    return std::string(reinterpret_cast<const char*>(record.get()), 29056);
+  }());
+
+  // Before the daemon ran: nothing saved, nothing published, and status
+  // creates neither the state directory nor the driver's record.
+  std::string report = status();
+  EXPECT_EQ(field(report, "verdict"), "stale") << report;
+  EXPECT_EQ(field(report, "saved boot session"), "(none)");
+  EXPECT_EQ(field(report, "chem ID"), "0x2168 (8552)");
+  EXPECT_EQ(field(report, "device type"), "T618e");
+  EXPECT_EQ(field(report, "model file"),
+            (device.dir() / "Library/KVR/BatteryModels" / modelPath).string());
+  EXPECT_EQ(field(report, "record SHA-1"), recordHash);
+  EXPECT_EQ(field(report, "driver's hash"), "(none published)");
+  EXPECT_FALSE(fs::exists(device.dir() / "state"));
+  EXPECT_FALSE(fs::exists(device.dir() / "driver"));
+
+  runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
+                      BatteryModelDataHandler::init().get());
+  const auto stateBefore = readWhole(device.statePath());
+  report = status();
+  EXPECT_EQ(field(report, "verdict"), "loaded") << report;
+  EXPECT_EQ(field(report, "driver's hash"), recordHash);
+  EXPECT_EQ(field(report, "saved boot session"),
+            "11111111-2222-3333-4444-555555555555 (this boot session)");
+
+  // The model file changed after the upload.
+  auto other = makeExampleModel(0x2168);
+  other->setMaxRdcRatio(9.0f);
+  device.installModel(modelPath, test::modelFile({other}));
+  report = status();
+  EXPECT_EQ(field(report, "verdict"), "mismatch") << report;
+  EXPECT_NE(field(report, "record SHA-1"), field(report, "driver's hash"));
+
+  // A new boot session.
+  auto json = test::defaultDeviceJSON();
+  json["sysctl"]["kern.bootsessionuuid"] = "99999999-2222-3333-4444-555555555555";
+  device.writeDeviceJSON(json);
+  EXPECT_EQ(field(status(), "verdict"), "stale");
+
+  // No model file at all.
+  fs::remove(device.dir() / "Library/KVR/BatteryModels" / modelPath);
+  report = status();
+  EXPECT_EQ(field(report, "verdict"), "missing") << report;
+  EXPECT_EQ(field(report, "model file exists"), "no");
+
+  // A model the record builder refuses.
+  auto incomplete = makeExampleModel(0x2168);
+  incomplete->clearGridOCVs();
+  device.installModel(modelPath, test::modelFile({incomplete}));
+  report = status();
+  EXPECT_EQ(field(report, "verdict"), "missing") << report;
+  EXPECT_EQ(field(report, "record SHA-1"), "(refused by the record builder)");
+  // With the builder's reason.
+  EXPECT_NE(report.find("\nthe daemon's code logged:\n  -[BatteryModelDataHandler "
+                        "createKextModelFromProtobufModel:] <Error> gridOCVs holds 0 elements, "
+                        "the record carries 303\n"),
+            std::string::npos)
+      << report;
+
+  EXPECT_EQ(readWhole(device.statePath()), stateBefore);
+}
+
+}  // namespace
+}  // namespace kolvrand

@@ -1,0 +1,156 @@
+// rcmodel status: what the daemon on this device would load and whether the
+// driver holds it. Read-only: it reads what the daemon reads, through the
+// daemon's own code, and never uploads or writes a setting.
+#include <cstdio>
+#include <cstdlib>
+#include <mutex>
+
+#include "daemon/BatteryModelTask.h"
+#include "model/OTAParamRC.h"
+#include "pipeline/BatteryModelDataHandler.h"
+#include "pipeline/DaemonIdentifier.h"
+#include "pipeline/KextBatteryModel.h"
+#include "platform/CommonCrypto.h"
+#include "platform/Defaults.h"
+#include "platform/FileManager.h"
+#include "tools/rcmodel/Tool.h"
+
+namespace kolvrand::rcmodel {
+
+namespace {
+
+constexpr const char* kHelp = R"HELP(usage: rcmodel status
+
+Reports, for the device in use (this host, or the simulated device in the
+directory named by KOLVRAND_DEVICE), what the daemon would do, without doing
+any of it: the current and the saved boot-session UUID, the battery's chem ID,
+the device type and the serial-number suffix, the model file the daemon would
+load, whether it exists and decodes, the SHA-1 of the record it would send, the
+hash the driver publishes, and a verdict:
+
+  loaded    the daemon uploaded in this boot session and the driver holds
+            exactly this model's record
+  stale     the daemon has not uploaded in this boot session; its next start will
+  mismatch  the driver holds another record than this model's (the model file
+            changed since the upload, or the upload was not confirmed)
+  missing   there is no model file, or it does not decode, or the daemon would
+            refuse it
+
+Nothing is uploaded and nothing is written. Exit status: 0 when the report was
+printed, whatever the verdict; 2 for a wrong command line.
+)HELP";
+
+// Keeps the handler's error lines for the report instead of printing them.
+class Collect : public LogSink {
+ public:
+  void write(LogLevel, std::string_view, std::string_view, std::string_view message) override {
+    while (!message.empty() && (message.back() == '\n' || message.back() == ' '))
+      message.remove_suffix(1);
+    std::lock_guard lock(mutex_);
+    lines_.emplace_back(message);
+  }
+  std::vector<std::string> lines() const {
+    std::lock_guard lock(mutex_);
+    return lines_;
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::vector<std::string> lines_;
+};
+
+void line(const char* key, const std::string& value) {
+  std::printf("%-20s %s\n", (std::string(key) + ":").c_str(), value.c_str());
+}
+
+std::string orNone(const std::optional<std::string>& s) {
+  return s ? (s->empty() ? "(empty)" : *s) : "(none)";
+}
+
+// The hash the driver publishes under KVRVector / KVRBatteryModel / RCParamsHash.
+std::optional<Data> publishedHash(BatteryModelDataHandler& handler) {
+  std::optional<Dictionary> kvrVector;
+  if (!handler.getKVRDebugDict(&kvrVector) || !kvrVector) return std::nullopt;
+  const Value* model = kvrVector->find("KVRBatteryModel");
+  if (!model || !model->isDictionary()) return std::nullopt;
+  const Value* hash = model->asDictionary()->find("RCParamsHash");
+  if (!hash || !hash->isData()) return std::nullopt;
+  return *hash->asData();
+}
+
+}  // namespace
+
+int runStatus(const std::vector<std::string>& args) {
+  Arguments a{"status"};
+  if (!a.parse(args, {})) return kExitUsage;
+  if (a.help) {
+    std::fputs(kHelp, stdout);
+    return kExitOK;
+  }
+  if (!a.operands.empty()) return usageError(a.command, "status takes no file");
+
+  auto collect = std::make_shared<Collect>();
+  setLogSink(collect);
+  setLogLevelSpec("error");
+
+  const char* device = std::getenv("KOLVRAND_DEVICE");
+  line("device", device && *device ? std::string("simulated device ") + device : "this host");
+
+  const std::optional<std::string> current = currentBootSessionUUID();
+  std::optional<std::string> saved;
+  if (auto defaults = NSUserDefaults::openExistingSuiteNamed(DaemonIdentifier))
+    saved = defaults->stringForKey("savedBootUUID");
+  line("boot session", current ? *current : "(cannot be read)");
+  line("saved boot session",
+       orNone(saved) + (saved && saved == current ? " (this boot session)" : ""));
+
+  // A handler without defaults reads the chem ID without storing it.
+  auto handler = std::make_shared<BatteryModelDataHandler>();
+  handler->setLog(os_log_create(DaemonIdentifier, "batteryModelDataHandling"));
+  const uint32_t chemID = handler->getBatteryChemID();
+  char chem[48];
+  std::snprintf(chem, sizeof chem, "0x%x (%u)", chemID, chemID);
+  line("chem ID", chem);
+  line("device type", orNone(handler->getDeviceType(chemID)));
+  const std::string suffix = handler->getSpecialCaseBatteryModelIdentifier(chemID);
+  line("suffix", suffix.empty() ? "(none)" : suffix);
+
+  const std::optional<std::string> path = handler->getBatteryModelFilePath(chemID);
+  const bool exists = path && NSFileManager::defaultManager().fileExistsAtPath(*path);
+  line("model file", orNone(path));
+  line("model file exists", exists ? "yes" : "no");
+  std::shared_ptr<OTAParamRC> model;
+  if (exists) model = handler->loadProtobufModelWithFileName(path);
+  line("model decodes", !exists ? "-" : model ? "yes" : "no");
+
+  std::unique_ptr<KextBatteryModel> record;
+  if (model) record = handler->createKextModelFromProtobufModel(model.get());
+  std::optional<SHA1Digest> recordHash;
+  if (record) recordHash = sha1(record.get(), sizeof(KextBatteryModel));
+  line("record SHA-1", recordHash ? hex(recordHash->data(), recordHash->size())
+                       : model    ? "(refused by the record builder)"
+                                  : "-");
+
+  const std::optional<Data> published = publishedHash(*handler);
+  line("driver's hash", published ? hex(published->data(), published->size()) : "(none published)");
+
+  const char* verdict = "loaded";
+  if (!recordHash)
+    verdict = "missing";
+  else if (!saved || !current || saved != current)
+    verdict = "stale";
+  else if (!published || *published != Data(recordHash->begin(), recordHash->end()))
+    verdict = "mismatch";
+  line("verdict", verdict);
+
+  const std::vector<std::string> lines = collect->lines();
+  if (!lines.empty()) {
+    std::printf("\nthe daemon's code logged:\n");
+    for (const std::string& l : lines) std::printf("  %s\n", l.c_str());
+  }
+  std::fflush(stdout);
+  setLogSink(nullptr);
+  return kExitOK;
+}
+
+}  // namespace kolvrand::rcmodel

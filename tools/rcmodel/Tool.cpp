@@ -1,0 +1,217 @@
+#include "tools/rcmodel/Tool.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <span>
+
+#include "model/OTAParamRC.h"
+#include "pipeline/PBStreamReader.h"
+#include "platform/Log.h"
+
+namespace kolvrand::rcmodel {
+
+namespace {
+
+class StderrSink : public LogSink {
+ public:
+  explicit StderrSink(std::string prefix) : prefix_(std::move(prefix)) {}
+  void write(LogLevel, std::string_view, std::string_view, std::string_view message) override {
+    while (!message.empty() && (message.back() == '\n' || message.back() == ' '))
+      message.remove_suffix(1);
+    std::fprintf(stderr, "%s: %.*s\n", prefix_.c_str(), static_cast<int>(message.size()),
+                 message.data());
+  }
+
+ private:
+  std::string prefix_;
+};
+
+std::optional<std::vector<uint8_t>> readStdin(const std::string& command, size_t limit) {
+  std::vector<uint8_t> bytes;
+  uint8_t buffer[65536];
+  for (;;) {
+    ssize_t n = ::read(STDIN_FILENO, buffer, sizeof buffer);
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) {
+      error(command, std::string("cannot read standard input: ") + std::strerror(errno));
+      return std::nullopt;
+    }
+    if (n == 0) return bytes;
+    bytes.insert(bytes.end(), buffer, buffer + n);
+    if (bytes.size() > limit) {
+      error(command, "standard input is larger than the " + std::to_string(limit) +
+                         "-byte limit; give a file instead");
+      return std::nullopt;
+    }
+  }
+}
+
+}  // namespace
+
+bool Arguments::parse(const std::vector<std::string>& args,
+                      const std::vector<std::string_view>& allowed) {
+  auto takes = [&](std::string_view option) {
+    for (std::string_view a : allowed)
+      if (a == option) return true;
+    return false;
+  };
+  bool operandsOnly = false;
+  for (size_t i = 0; i < args.size(); ++i) {
+    const std::string& a = args[i];
+    if (operandsOnly || a == "-" || a.empty() || a[0] != '-') {
+      operands.push_back(a);
+    } else if (a == "--") {
+      operandsOnly = true;
+    } else if (a == "-h" || a == "--help") {
+      help = true;
+    } else if (a == "--raw" && takes("--raw")) {
+      raw = true;
+    } else if ((a == "-o" || a == "--output") && takes("-o")) {
+      if (i + 1 == args.size()) {
+        usageError(command, a + " needs a file name");
+        return false;
+      }
+      output = args[++i];
+    } else if (a.starts_with("--output=") && takes("-o")) {
+      output = a.substr(9);
+    } else {
+      usageError(command, "unknown option " + a);
+      return false;
+    }
+  }
+  return true;
+}
+
+void error(const std::string& command, const std::string& message) {
+  std::fprintf(stderr, "rcmodel %s: %s\n", command.c_str(), message.c_str());
+}
+
+int usageError(const std::string& command, const std::string& message) {
+  error(command, message + "; see rcmodel " + command + " --help");
+  return kExitUsage;
+}
+
+std::optional<std::vector<uint8_t>> readInput(const std::string& command, const std::string& path) {
+  // JSON written by hand is small; the limit only guards against the wrong file.
+  constexpr size_t kLimit = 256 * 1024 * 1024;
+  if (path == "-") return readStdin(command, kLimit);
+  std::error_code ec;
+  if (std::filesystem::is_directory(path, ec)) {
+    error(command, path + ": is a directory; give a file");
+    return std::nullopt;
+  }
+  std::FILE* file = std::fopen(path.c_str(), "rb");
+  if (!file) {
+    error(command, path + ": cannot open: " + std::strerror(errno));
+    return std::nullopt;
+  }
+  std::vector<uint8_t> bytes;
+  uint8_t buffer[65536];
+  size_t n = 0;
+  while ((n = std::fread(buffer, 1, sizeof buffer, file)) > 0) {
+    bytes.insert(bytes.end(), buffer, buffer + n);
+    if (bytes.size() > kLimit) break;
+  }
+  const bool failed = std::ferror(file) || bytes.size() > kLimit;
+  std::fclose(file);
+  if (failed) {
+    error(command, path + ": cannot read it whole");
+    return std::nullopt;
+  }
+  return bytes;
+}
+
+std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
+                                                   const std::string& path) {
+  if (path == "-") return readStdin(command, PBStreamReader::kMaxFileSize);
+  NSError why;
+  auto bytes = PBStreamReader::readFile(path, &why);
+  if (!bytes) error(command, why.localizedDescription);
+  return bytes;
+}
+
+bool writeOutput(const std::string& command, const std::string& path, std::string_view bytes) {
+  if (path == "-") {
+    if (std::fwrite(bytes.data(), 1, bytes.size(), stdout) != bytes.size() || std::fflush(stdout)) {
+      error(command, "cannot write standard output");
+      return false;
+    }
+    return true;
+  }
+  namespace fs = std::filesystem;
+  const fs::path target(path);
+  fs::path dir = target.parent_path();
+  if (dir.empty()) dir = ".";
+  std::string temporary = (dir / ("." + target.filename().string() + ".XXXXXX")).string();
+  int fd = ::mkstemp(temporary.data());
+  if (fd < 0) {
+    error(command, path + ": cannot write: " + std::strerror(errno));
+    return false;
+  }
+  size_t written = 0;
+  int err = 0;
+  while (written < bytes.size()) {
+    ssize_t n = ::write(fd, bytes.data() + written, bytes.size() - written);
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) {
+      err = errno;
+      break;
+    }
+    written += static_cast<size_t>(n);
+  }
+  // mkstemp makes the file private; an output file gets the usual mode.
+  const mode_t mask = ::umask(0);
+  ::umask(mask);
+  if (!err && ::fchmod(fd, 0666 & ~mask) != 0) err = errno;
+  if (::close(fd) != 0 && !err) err = errno;
+  if (!err && ::rename(temporary.c_str(), path.c_str()) != 0) err = errno;
+  if (err) {
+    ::unlink(temporary.c_str());
+    error(command, path + ": cannot write: " + std::strerror(err));
+    return false;
+  }
+  return true;
+}
+
+std::string hex(const uint8_t* bytes, size_t size) {
+  static const char kHex[] = "0123456789abcdef";
+  std::string out;
+  for (size_t i = 0; i < size; ++i) {
+    out += kHex[bytes[i] >> 4];
+    out += kHex[bytes[i] & 15];
+  }
+  return out;
+}
+
+void routeLogToStderr(const std::string& command) {
+  setLogSink(std::make_shared<StderrSink>("rcmodel " + command));
+  setLogLevelSpec("error");
+}
+
+std::shared_ptr<OTAParamRC> readFirstModel(const std::string& command, const std::string& path,
+                                           size_t* count) {
+  auto bytes = readModelInput(command, path);
+  if (!bytes) return nullptr;
+  NSError why;
+  auto models =
+      PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(std::span<const uint8_t>(*bytes), &why);
+  if (!models) {
+    error(command, path + ": " + why.localizedDescription +
+                       "; check that it is a model file (rcmodel decode shows its messages)");
+    return nullptr;
+  }
+  if (count) *count = models->size();
+  if (models->empty()) {
+    error(command, path + ": holds no message; a model file holds at least one OTAParamRC");
+    return nullptr;
+  }
+  return models->front();
+}
+
+}  // namespace kolvrand::rcmodel

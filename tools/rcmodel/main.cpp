@@ -1,0 +1,65 @@
+// rcmodel: for the people who write, ship and debug battery models. Decodes
+// and encodes model files, builds the record the daemon would upload, checks
+// a model against that record, draws it, and tells what the daemon on this
+// device would load.
+#include <cstdio>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "tools/rcmodel/Tool.h"
+
+namespace {
+
+constexpr const char* kUsage = R"HELP(usage: rcmodel COMMAND [ARGS]
+
+Commands:
+  decode [--raw] FILE|-            print each message of a model file as JSON, one per line
+  encode [--raw] JSON|- -o FILE    write a model file from JSON (the reverse of decode)
+  record FILE [-o OUT]             build the daemon's record from the file's first message
+                                   and print its SHA-1
+  validate FILE...                 check that each file decodes and fills the record
+  plot FILE -o OUT.svg             draw the OCV grid and the resistance tables
+  status                           what the daemon on this device would load, and whether
+                                   the driver holds it (read-only)
+
+Run `rcmodel COMMAND --help` for the details of one command.
+
+Exit status: 0 on success; 1 when a model cannot be decoded, would be refused by
+the daemon, or a file cannot be read or written; 2 for a wrong command line or
+wrong JSON.
+
+Environment: KOLVRAND_DEVICE=DIR makes status look at the simulated device in DIR
+instead of this host.
+)HELP";
+
+struct Command {
+  std::string_view name;
+  int (*run)(const std::vector<std::string>&);
+};
+
+constexpr Command kCommands[] = {
+    {"decode", kolvrand::rcmodel::runDecode}, {"encode", kolvrand::rcmodel::runEncode},
+    {"record", kolvrand::rcmodel::runRecord}, {"validate", kolvrand::rcmodel::runValidate},
+    {"plot", kolvrand::rcmodel::runPlot},     {"status", kolvrand::rcmodel::runStatus},
+};
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  std::vector<std::string> args(argv + 1, argv + argc);
+  if (args.empty()) {
+    std::fputs(kUsage, stderr);
+    return kolvrand::rcmodel::kExitUsage;
+  }
+  const std::string& name = args.front();
+  if (name == "-h" || name == "--help" || name == "help") {
+    std::fputs(kUsage, stdout);
+    return kolvrand::rcmodel::kExitOK;
+  }
+  for (const Command& command : kCommands)
+    if (name == command.name) return command.run({args.begin() + 1, args.end()});
+  std::fprintf(stderr, "rcmodel: unknown command \"%s\"; run rcmodel --help for the commands\n",
+               name.c_str());
+  return kolvrand::rcmodel::kExitUsage;
+}
