@@ -64,15 +64,20 @@ TEST(CrashSafety, SettingsHoldOldOrNewValuesAfterAWriterIsKilled) {
   // A key no writer touches, which must never be lost.
   ASSERT_TRUE(defaults->setObject("kept", "other"));
 
-  // How long one writer takes from fork to exit, so the kills spread over it.
-  writeAll(*defaults, expectedValues(0, true));
-  auto start = std::chrono::steady_clock::now();
-  pid_t pid = startWriter(dir, 0);
+  // How long one writer takes from fork to exit (the longest of three), so
+  // the kills spread over its whole run.
+  std::chrono::microseconds span{0};
+  pid_t pid = 0;
   int status = 0;
-  ASSERT_EQ(waitpid(pid, &status, 0), pid);
-  ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
-  const auto span = std::chrono::duration_cast<std::chrono::microseconds>(
-      std::chrono::steady_clock::now() - start);
+  for (int i = 0; i < 3; ++i) {
+    writeAll(*defaults, expectedValues(0, true));
+    const auto start = std::chrono::steady_clock::now();
+    pid = startWriter(dir, 0);
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+    span = std::max(span, std::chrono::duration_cast<std::chrono::microseconds>(
+                              std::chrono::steady_clock::now() - start));
+  }
 
   const unsigned seed = std::random_device{}();
   std::mt19937 rng(seed);
