@@ -268,12 +268,21 @@ std::string drawing(const OTAParamRC& model, const std::string& name) {
   Svg svg;
   svg.text(24, 32, "Battery model " + name, "font-size=\"18\" font-weight=\"bold\"");
   double y = 54;
-  for (const std::string& s : summary(model)) {
-    svg.text(24, y, s, "font-size=\"12\" fill=\"#333\"");
-    y += 18;
+  for (std::string s : summary(model)) {
+    // About 170 characters fit the width; longer lines break at a gap.
+    while (!s.empty()) {
+      size_t cut = s.size() <= 170 ? s.size() : s.rfind("  ", 170);
+      if (cut == std::string::npos || cut == 0) cut = std::min<size_t>(s.size(), 170);
+      svg.text(24, y, s.substr(0, cut), "font-size=\"12\" fill=\"#333\" xml:space=\"preserve\"");
+      s = s.substr(cut);
+      while (s.starts_with(' ')) s.erase(0, 1);
+      if (!s.empty()) s = "    " + s;
+      y += 18;
+    }
   }
 
-  // The OCV grid.
+  // The OCV grid: the curves, and beside them how far each temperature band
+  // lies from the first, which the curves themselves are too close to show.
   y += 12;
   svg.text(24, y + 12, "Open-circuit voltage (gridOCV)", "font-size=\"15\" font-weight=\"bold\"");
   std::span<const float> grid(model.gridOCVs(), model.gridOCVsCount());
@@ -282,7 +291,8 @@ std::string drawing(const OTAParamRC& model, const std::string& name) {
   for (size_t i = 0; i < bands.size(); ++i)
     ocv.push_back({bands.size() > 1 ? "temperature band " + std::to_string(i + 1) : "OCV", bands[i],
                    kColors[i % std::size(kColors)], false});
-  Frame frame{90, y + 44, kWidth - 180, kOCVHeight - 110};
+  const bool compare = bands.size() > 1;
+  Frame frame{90, y + 44, compare ? kWidth * 0.6 - 120 : kWidth - 180, kOCVHeight - 110};
   const Scale ocvScale = Scale::of(ocv);
   frame.axes(svg, ocvScale, "gridOCV", nullptr, "");
   frame.curves(svg, ocv, ocvScale);
@@ -290,31 +300,47 @@ std::string drawing(const OTAParamRC& model, const std::string& name) {
     svg.text(frame.x + frame.w / 2, frame.y + frame.h / 2, "no OCV points",
              "text-anchor=\"middle\" fill=\"#999\"");
   legend(svg, frame.x, y + 34, ocv);
-  svg.text(frame.x + frame.w, y + 34, std::to_string(grid.size()) + " points",
-           "text-anchor=\"end\" font-size=\"11\" fill=\"#555\"");
+  svg.text(frame.x + frame.w, frame.y - 6, std::to_string(grid.size()) + " points",
+           "text-anchor=\"end\" font-size=\"10\" fill=\"#777\"");
+  if (compare) {
+    std::vector<std::vector<float>> differences;
+    for (const auto& band : bands) {
+      std::vector<float> d(band.size());
+      for (size_t i = 0; i < band.size(); ++i) d[i] = band[i] - bands[0][i];
+      differences.push_back(std::move(d));
+    }
+    std::vector<Series> spread;
+    for (size_t i = 0; i < differences.size(); ++i)
+      spread.push_back({"", differences[i], kColors[i % std::size(kColors)], false});
+    Frame beside{kWidth * 0.6 + 70, y + 44, kWidth * 0.4 - 110, kOCVHeight - 110};
+    const Scale spreadScale = Scale::of(spread);
+    beside.axes(svg, spreadScale, "gridOCV minus band 1", nullptr, "");
+    beside.curves(svg, spread, spreadScale);
+    svg.text(beside.x + beside.w / 2, beside.y - 6, "each band minus band 1",
+             "text-anchor=\"middle\" font-size=\"11\"");
+  }
   y += kOCVHeight;
 
   // The resistance tables, in record order.
   svg.text(24, y + 12, "Resistance tables", "font-size=\"15\" font-weight=\"bold\"");
   const std::vector<Series> key = {
-      {"resistance at 25 °C (resistance25C, left axis)", {}, "#000", false},
-      {"temperature coefficients, band 1, 2, 3 (temperatureCoeff, right axis)",
-       {},
-       kColors[0],
-       true},
+      {"resistance25C (left axis)", {}, "#000", false},
+      {"temperatureCoeff band 1 (right axis)", {}, kColors[0], true},
+      {"band 2", {}, kColors[1], true},
+      {"band 3", {}, kColors[2], true},
   };
-  legend(svg, 260, y + 12, key);
+  legend(svg, 240, y + 12, key);
   y += 28;
   const auto tables = kextTableSources();
   const auto lists = kextTableListSources();
   for (size_t i = 0; i < tables.size(); ++i) {
     const double px = (i % kColumns) * kPanelWidth;
     const double py = y + (i / kColumns) * kPanelHeight;
-    svg.text(px + kPanelWidth / 2, py + 18, tables[i].field,
-             "text-anchor=\"middle\" font-size=\"13\" font-weight=\"bold\"");
     Frame f{px + 62, py + 28, kPanelWidth - 124, kPanelHeight - 72};
     const OTAResistanceData* table = tables[i].table(model);
     if (!table) {
+      svg.text(px + kPanelWidth / 2, py + 18, tables[i].field,
+               "text-anchor=\"middle\" font-size=\"13\" font-weight=\"bold\"");
       svg.body += "<rect x=\"" + num(f.x) + "\" y=\"" + num(f.y) + "\" width=\"" + num(f.w) +
                   "\" height=\"" + num(f.h) + "\" fill=\"#fff0f0\" stroke=\"#c88\"/>\n";
       svg.text(f.x + f.w / 2, f.y + f.h / 2, "missing: the daemon refuses the model",
@@ -323,6 +349,12 @@ std::string drawing(const OTAParamRC& model, const std::string& name) {
     }
     const std::span<const float> r25 = lists[0].elements(*table);
     const std::span<const float> tc = lists[1].elements(*table);
+    // The title, with the two lists' counts in small print.
+    svg.body +=
+        "<text x=\"" + num(px + kPanelWidth / 2) + "\" y=\"" + num(py + 18) +
+        "\" text-anchor=\"middle\" font-size=\"13\" font-weight=\"bold\">" +
+        escape(tables[i].field) + "<tspan font-size=\"9\" font-weight=\"normal\" fill=\"#777\"> " +
+        std::to_string(r25.size()) + " + " + std::to_string(tc.size()) + " values</tspan></text>\n";
     std::vector<Series> left = {{"", r25, "#000", false}};
     std::vector<Series> right;
     const auto tcBands = runs(tc, r25.size());
@@ -332,9 +364,6 @@ std::string drawing(const OTAParamRC& model, const std::string& name) {
     f.axes(svg, l, "resistance25C", &r, "temperatureCoeff");
     f.curves(svg, right, r);
     f.curves(svg, left, l);
-    svg.text(f.x + f.w, f.y - 4,
-             std::to_string(r25.size()) + " + " + std::to_string(tc.size()) + " values",
-             "text-anchor=\"end\" font-size=\"9\" fill=\"#777\"");
   }
   const double height = y + ((tables.size() + kColumns - 1) / kColumns) * kPanelHeight + 10;
 
