@@ -292,8 +292,10 @@ TEST(Rcmodel, PlotDrawsTheGridAndEveryTable) {
     for (size_t at = svg.find(what); at != std::string::npos; at = svg.find(what, at + 1)) ++n;
     return n;
   };
-  // Three OCV bands; for 16 tables, one resistance curve and three bands.
-  EXPECT_EQ(count("<polyline"), 3u + 16u * 4u);
+  // Three OCV bands and their spread; for 16 tables, one resistance curve
+  // and three bands of temperature coefficients.
+  EXPECT_EQ(count("<polyline"), 3u + 3u + 16u * 4u);
+  EXPECT_EQ(count(">each band minus band 1<"), 1u);
   EXPECT_EQ(count("temperature band "), 3u);
   EXPECT_EQ(count(">missing: the daemon refuses the model<"), 1u);
   EXPECT_EQ(count("<text"), count("</text>"));
