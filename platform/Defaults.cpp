@@ -4,6 +4,8 @@
 #include <sys/file.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <cctype>
 #include <cerrno>
 #include <cstring>
 #include <map>
@@ -165,6 +167,24 @@ JSON load(NSUserDefaults::Suite& s) {
   return readSuite(s.path);
 }
 
+// A writer killed between creating its temporary file (SUITE.json.XXXXXX)
+// and renaming it leaves that file behind. Temporaries are made only under
+// the exclusive lock, so any found while holding it is such a leftover.
+void removeStaleTemporaries(const std::filesystem::path& path) {
+  const std::string prefix = path.filename().string() + ".";
+  std::error_code ec;
+  for (std::filesystem::directory_iterator it(path.parent_path(), ec), end; !ec && it != end;
+       it.increment(ec)) {
+    const std::string name = it->path().filename().string();
+    if (name.size() == prefix.size() + 6 && name.starts_with(prefix) &&
+        std::all_of(name.begin() + static_cast<std::ptrdiff_t>(prefix.size()), name.end(),
+                    [](unsigned char c) { return std::isalnum(c); })) {
+      std::error_code ignored;
+      std::filesystem::remove(it->path(), ignored);
+    }
+  }
+}
+
 // Read-modify-write under the exclusive lock, so that writers in other
 // processes never lose each other's keys.
 template <typename F>
@@ -181,6 +201,7 @@ bool update(NSUserDefaults::Suite& s, std::string_view key, F&& modify) {
                  std::strerror(fileLock.error()), key);
     return false;
   }
+  removeStaleTemporaries(s.path);
   JSON content = readSuite(s.path);
   modify(content);
   std::string error;
