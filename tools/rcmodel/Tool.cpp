@@ -52,6 +52,18 @@ std::optional<std::vector<uint8_t>> readStdin(const std::string& command, size_t
   }
 }
 
+// The stream reader's buffer type is its own business (a vector, or a buffer
+// with bytes()); a model is small enough to copy.
+template <typename Contents>
+std::vector<uint8_t> copyBytes(const Contents& contents) {
+  if constexpr (requires { contents.bytes(); }) {
+    const auto bytes = contents.bytes();
+    return std::vector<uint8_t>(bytes.begin(), bytes.end());
+  } else {
+    return std::vector<uint8_t>(contents.begin(), contents.end());
+  }
+}
+
 }  // namespace
 
 bool Arguments::parse(const std::vector<std::string>& args,
@@ -108,7 +120,7 @@ std::optional<std::vector<uint8_t>> readInput(const std::string& command, const 
   }
   std::FILE* file = std::fopen(path.c_str(), "rb");
   if (!file) {
-    error(command, path + ": cannot open: " + std::strerror(errno));
+    error(command, path + ": cannot open: " + std::strerror(errno) + "; check the file's path");
     return std::nullopt;
   }
   std::vector<uint8_t> bytes;
@@ -131,9 +143,12 @@ std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
                                                    const std::string& path) {
   if (path == "-") return readStdin(command, PBStreamReader::kMaxFileSize);
   NSError why;
-  auto bytes = PBStreamReader::readFile(path, &why);
-  if (!bytes) error(command, why.localizedDescription);
-  return bytes;
+  auto file = PBStreamReader::readFile(path, &why);
+  if (!file) {
+    error(command, why.localizedDescription + "; give the path of a model file");
+    return std::nullopt;
+  }
+  return copyBytes(*file);
 }
 
 bool writeOutput(const std::string& command, const std::string& path, std::string_view bytes) {
