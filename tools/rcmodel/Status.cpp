@@ -1,6 +1,7 @@
 // rcmodel status: what the daemon on this device would load and whether the
 // driver holds it. Read-only: it reads what the daemon reads, through the
 // daemon's own code, and never uploads or writes a setting.
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <mutex>
@@ -143,7 +144,11 @@ int runStatus(const std::vector<std::string>& args) {
     verdict = "mismatch";
   line("verdict", verdict);
 
-  const std::vector<std::string> lines = collect->lines();
+  // The device type is asked for twice (for the report and for the path), so
+  // a failure to read it would show twice.
+  std::vector<std::string> lines;
+  for (const std::string& l : collect->lines())
+    if (std::find(lines.begin(), lines.end(), l) == lines.end()) lines.push_back(l);
   if (!lines.empty()) {
     std::printf("\nthe daemon's code logged:\n");
     for (const std::string& l : lines) std::printf("  %s\n", l.c_str());
