@@ -1,3 +1,4 @@
+#include <bit>
 #include <cstring>
 
 #include "model/FieldEngine.h"
@@ -7,46 +8,167 @@ namespace kolvrand::detail {
 
 namespace {
 
+// Room for `count` more elements of `list`: a list with no array yet takes it
+// from the reader's shared array, so that decoding allocates once for all
+// lists; any other list grows its own.
+inline float* appendRoom(PBDataReader& reader, MutableFields& fields, PBRepeatedFloat& list,
+                         size_t count) {
+  if (list.capacity() == 0 && fields.lentFloats) {
+    if (float* room = reader.takeFloats(count, *fields.lentFloats)) list.lend(room, count);
+  }
+  return list.appendUninitialized(count);
+}
+
 // A packed run; the reader's limit is narrowed to it. Whole floats are taken
 // in one copy (the run's length was checked against the bytes that remain, so
 // the list grows by at most remaining() / 4); a tail of 1 to 3 bytes appends
 // 0.0 and sets the error flag.
-void readPackedRun(PBDataReader& reader, PBRepeatedFloat& list) {
+void readPackedRun(PBDataReader& reader, MutableFields& fields, PBRepeatedFloat& list) {
   const size_t whole = reader.remaining() / 4;
-  list.appendLittleEndian(reader.cursor(), whole);
-  reader.advance(whole * 4);
+  if (whole) {
+    float* out = appendRoom(reader, fields, list, whole);
+    if constexpr (std::endian::native == std::endian::little) {
+      std::memcpy(out, reader.cursor(), whole * 4);
+    } else {
+      for (size_t i = 0; i < whole; ++i) out[i] = wire::loadFloat(reader.cursor() + 4 * i);
+    }
+    reader.advance(whole * 4);
+  }
   if (!reader.isAtEnd()) list.add(reader.readFloat());
 }
 
-// Whether the `size` bytes at `p` are the tag bytes at `tag`. Field numbers
-// below 2048 have one- or two-byte tags, compared without a memcmp call.
-bool sameTag(const uint8_t* p, const uint8_t* tag, size_t size) {
-  switch (size) {
-    case 1:
-      return p[0] == tag[0];
-    case 2:
-      return p[0] == tag[0] && p[1] == tag[1];
-    default:
-      return std::memcmp(p, tag, size) == 0;
+// Entries of an unpacked run: TagSize tag bytes and a fixed32 each. The tags
+// of two neighbouring entries lie within eight bytes, so four entries are
+// tested with two loads and one branch.
+template <size_t TagSize>
+struct Run {
+  static constexpr size_t kStride = TagSize + 4;
+  static_assert(kStride + TagSize <= 8 && 2 * kStride >= 8);
+
+  explicit Run(const uint8_t* tagBytes) : tag(tagBytes) {
+    uint8_t maskBytes[8] = {}, pairBytes[8] = {};
+    for (size_t k = 0; k < TagSize; ++k) {
+      maskBytes[k] = maskBytes[kStride + k] = 0xff;
+      pairBytes[k] = pairBytes[kStride + k] = tag[k];
+    }
+    std::memcpy(&mask, maskBytes, 8);
+    std::memcpy(&pair, pairBytes, 8);
   }
+
+  // Whether entries i .. i+3 at p all carry the tag; they must be whole.
+  bool fourSame(const uint8_t* p, size_t i) const {
+    uint64_t a, b;
+    std::memcpy(&a, p + i * kStride, 8);
+    std::memcpy(&b, p + (i + 2) * kStride, 8);
+    return (((a & mask) ^ pair) | ((b & mask) ^ pair)) == 0;
+  }
+  bool same(const uint8_t* p, size_t i) const {
+    return std::memcmp(p + i * kStride, tag, TagSize) == 0;
+  }
+  static float value(const uint8_t* p, size_t i) {
+    return wire::loadFloat(p + i * kStride + TagSize);
+  }
+
+  // The number of entries, at most `fit`, at p that carry the tag.
+  size_t count(const uint8_t* p, size_t fit) const {
+    size_t n = 0;
+    while (n + 4 <= fit && fourSame(p, n)) n += 4;
+    while (n < fit && same(p, n)) ++n;
+    return n;
+  }
+  // The values of the first n entries at p.
+  static void copy(float* out, const uint8_t* p, size_t n) {
+    size_t i = 0;
+    for (; i + 4 <= n; i += 4) {
+      out[i] = value(p, i);
+      out[i + 1] = value(p, i + 1);
+      out[i + 2] = value(p, i + 2);
+      out[i + 3] = value(p, i + 3);
+    }
+    for (; i < n; ++i) out[i] = value(p, i);
+  }
+  // count() and copy() in one pass: out has room for `fit` values.
+  size_t countAndCopy(float* out, const uint8_t* p, size_t fit) const {
+    size_t n = 0;
+    for (; n + 4 <= fit; n += 4) {
+      // Whole entries, so copying before the test is harmless.
+      out[n] = value(p, n);
+      out[n + 1] = value(p, n + 1);
+      out[n + 2] = value(p, n + 2);
+      out[n + 3] = value(p, n + 3);
+      if (!fourSame(p, n)) break;
+    }
+    for (; n < fit && same(p, n); ++n) out[n] = value(p, n);
+    return n;
+  }
+
+  const uint8_t* tag;
+  uint64_t mask, pair;
+};
+
+// The rest of a run once its first value is read: `fit` whole entries follow
+// at `next`. An empty list fills the reader's shared array in one pass; any
+// other list counts the run, grows once and copies.
+template <size_t TagSize>
+size_t readRunTail(PBDataReader& reader, MutableFields& fields, PBRepeatedFloat& list,
+                   const uint8_t* tag, float first, const uint8_t* next, size_t fit) {
+  const Run<TagSize> run(tag);
+  if (list.capacity() == 0 && fields.lentFloats) {
+    size_t available;
+    float* room = reader.floatRoom(*fields.lentFloats, &available);
+    if (room && available > fit) {
+      room[0] = first;
+      const size_t n = run.countAndCopy(room + 1, next, fit);
+      reader.claimFloats(n + 1, *fields.lentFloats);
+      list.lend(room, n + 1);
+      list.appendUninitialized(n + 1);
+      return n;
+    }
+  }
+  const size_t n = run.count(next, fit);
+  float* out = appendRoom(reader, fields, list, n + 1);
+  out[0] = first;
+  run.copy(out + 1, next, n);
+  return n;
+}
+
+size_t readRunTailOtherTag(PBRepeatedFloat& list, const uint8_t* tag, size_t tagSize, float first,
+                           const uint8_t* next, size_t fit) {
+  const size_t stride = tagSize + 4;
+  size_t n = 0;
+  while (n < fit && std::memcmp(next + n * stride, tag, tagSize) == 0) ++n;
+  float* out = list.appendUninitialized(n + 1);
+  out[0] = first;
+  for (size_t i = 0; i < n; ++i) out[1 + i] = wire::loadFloat(next + i * stride + tagSize);
+  return n;
 }
 
 // One unpacked element, whose tag is the `tagSize` bytes at `tag`, then every
 // directly following entry with the very same tag bytes: the usual shape of a
-// list written unpacked. The run is counted first (only whole entries before
-// the limit), so the list grows once and the dispatch loop is not re-entered
-// per element.
-void readUnpackedRun(PBDataReader& reader, PBRepeatedFloat& list, const uint8_t* tag,
-                     size_t tagSize) {
-  list.add(reader.readFloat());
-  if (reader.hasError()) return;
-  const size_t stride = tagSize + 4;
-  const size_t fit = reader.remaining() / stride;
-  const uint8_t* p = reader.cursor();
-  size_t n = 0;
-  while (n < fit && sameTag(p + n * stride, tag, tagSize)) ++n;
-  list.appendStrided(p + tagSize, n, stride);
-  reader.advance(n * stride);
+// list written unpacked. Only whole entries before the limit count; the list
+// grows once, to its exact size when it was empty, and the dispatch loop is
+// not re-entered per element.
+void readUnpackedRun(PBDataReader& reader, MutableFields& fields, PBRepeatedFloat& list,
+                     const uint8_t* tag, size_t tagSize) {
+  if (reader.remaining() < 4) {
+    list.add(reader.readFloat());  // sets the error flag and appends 0.0
+    return;
+  }
+  const float first = wire::loadFloat(reader.cursor());
+  const uint8_t* next = reader.cursor() + 4;
+  const size_t fit = (reader.remaining() - 4) / (tagSize + 4);
+  size_t n;
+  switch (tagSize) {
+    case 1:
+      n = readRunTail<1>(reader, fields, list, tag, first, next, fit);
+      break;
+    case 2:
+      n = readRunTail<2>(reader, fields, list, tag, first, next, fit);
+      break;
+    default:
+      n = readRunTailOtherTag(list, tag, tagSize, first, next, fit);
+  }
+  reader.advance(4 + n * (tagSize + 4));
 }
 
 }  // namespace
@@ -85,10 +207,11 @@ bool readFields(const MessageTable& table, MutableFields fields, PBDataReader& r
         if (wireType == wire::kLengthDelimited) {
           PBDataReaderMark mark;
           if (!PBReaderPlaceMark(reader, mark)) return false;
-          readPackedRun(reader, list);
+          readPackedRun(reader, fields, list);
           PBReaderRecallMark(reader, mark);
         } else {
-          readUnpackedRun(reader, list, reader.bytes() + tagStart, reader.position() - tagStart);
+          readUnpackedRun(reader, fields, list, reader.bytes() + tagStart,
+                          reader.position() - tagStart);
         }
         break;
       }

@@ -22,6 +22,9 @@ struct MutableFields {
   float* floats;
   uint32_t* ints;  // unsigned values, and signed ones as their bit pattern
   uint32_t* has;
+  // The array the decoder lent room in to this message's lists, kept alive
+  // as long as the message (see PBDataReader::takeFloats).
+  std::shared_ptr<float[]>* lentFloats = nullptr;
 };
 
 struct ConstFields {
@@ -34,13 +37,17 @@ struct ConstFields {
 
 template <size_t NSub, size_t NList, size_t NFloat, size_t NInt>
 struct FieldStorage {
+  // Declared before the lists, so that it outlives them.
+  std::shared_ptr<float[]> lentFloats;
   std::array<std::shared_ptr<PBCodable>, NSub> subs{};
   std::array<PBRepeatedFloat, NList> lists{};
   std::array<float, NFloat> floats{};
   std::array<uint32_t, NInt> ints{};
   uint32_t has = 0;
 
-  MutableFields view() { return {subs.data(), lists.data(), floats.data(), ints.data(), &has}; }
+  MutableFields view() {
+    return {subs.data(), lists.data(), floats.data(), ints.data(), &has, &lentFloats};
+  }
   ConstFields view() const { return {subs.data(), lists.data(), floats.data(), ints.data(), has}; }
 
   bool hasBit(unsigned bit) const { return (has >> bit) & 1u; }

@@ -30,4 +30,12 @@ uint64_t PBDataReader::readVarintChecked() {
   return 0;
 }
 
+void PBDataReader::makeFloats() {
+  const size_t bound = (length_ - pos_) / 4;
+  if (bound == 0) return;
+  // Not zeroed: a list writes every element before it counts it.
+  floats_ = std::make_shared_for_overwrite<float[]>(bound);
+  floatsSize_ = bound;
+}
+
 }  // namespace kolvrand

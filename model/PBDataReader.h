@@ -8,6 +8,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 
 #include "model/Wire.h"
 
@@ -43,9 +44,54 @@ class PBDataReader {
   // still has its top bit set yields 0 without an error; the 10 bytes are
   // consumed.
   uint64_t readVarint() {
-    if (pos_ < limit_ && bytes_[pos_] < 0x80) return bytes_[pos_++];
+    // One and two bytes inline: every tag of the model and most lengths.
+    if (remaining() >= 2) {
+      const uint8_t b0 = bytes_[pos_];
+      if (b0 < 0x80) {
+        pos_ += 1;
+        return b0;
+      }
+      const uint8_t b1 = bytes_[pos_ + 1];
+      if (b1 < 0x80) {
+        pos_ += 2;
+        return (b0 & 0x7fu) | (uint64_t{b1} << 7);
+      }
+    }
     if (remaining() >= wire::kMaxVarintSize) return readVarintUnchecked();
     return readVarintChecked();
+  }
+
+  // Room for the floats of the lists being decoded. Every list decoded from
+  // this reader draws on one array: each float takes at least four input
+  // bytes, so an array of a quarter of the bytes left at the first request
+  // holds them all, and the lists of a whole model cost one allocation.
+  // `keepAlive` is the drawing message's reference to that array, set at its
+  // first claim; a message that already holds another array draws nothing
+  // (nullptr) and allocates for itself.
+  //
+  // The free part of the array, *available floats long, which a list may
+  // fill before it claims what it used with claimFloats.
+  float* floatRoom(const std::shared_ptr<float[]>& keepAlive, size_t* available) {
+    if (!floats_) makeFloats();
+    if (!floats_ || (keepAlive && keepAlive.get() != floats_.get())) {
+      *available = 0;
+      return nullptr;
+    }
+    *available = floatsSize_ - floatsUsed_;
+    return floats_.get() + floatsUsed_;
+  }
+  // Claims the first `count` floats of floatRoom; requires count <= available.
+  void claimFloats(size_t count, std::shared_ptr<float[]>& keepAlive) {
+    if (!keepAlive) keepAlive = floats_;
+    floatsUsed_ += count;
+  }
+  // Room for exactly `count` floats, or nullptr.
+  float* takeFloats(size_t count, std::shared_ptr<float[]>& keepAlive) {
+    size_t available;
+    float* room = floatRoom(keepAlive, &available);
+    if (!room || count == 0 || count > available) return nullptr;
+    claimFloats(count, keepAlive);
+    return room;
   }
 
   // Four little-endian bytes as an IEEE single. With fewer than four bytes
@@ -64,6 +110,7 @@ class PBDataReader {
   // Requires remaining() >= 10.
   uint64_t readVarintUnchecked();
   uint64_t readVarintChecked();
+  void makeFloats();
 
   friend bool PBReaderPlaceMark(PBDataReader& reader, PBDataReaderMark& mark);
   friend void PBReaderRecallMark(PBDataReader& reader, const PBDataReaderMark& mark);
@@ -73,6 +120,9 @@ class PBDataReader {
   size_t limit_;
   size_t length_;
   bool error_ = false;
+  std::shared_ptr<float[]> floats_;  // made at the first takeFloats
+  size_t floatsUsed_ = 0;
+  size_t floatsSize_ = 0;
 };
 
 // Reads a length varint and narrows the limit to the run of that many bytes

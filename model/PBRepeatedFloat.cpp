@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <bit>
 #include <cstring>
+#include <new>
 
 #include "model/NSRangeException.h"
 #include "model/Wire.h"
@@ -13,37 +14,49 @@ void PBRepeatedFloat::throwOutOfRange(size_t index, size_t count) {
   throw NSRangeException(index, count);
 }
 
+void PBRepeatedFloat::grow(size_t more) {
+  constexpr size_t kMaxElements = SIZE_MAX / sizeof(float);
+  if (more > kMaxElements - size_) throw std::bad_array_new_length();
+  const size_t needed = size_ + more;
+  const size_t doubled = capacity_ <= kMaxElements / 2 ? 2 * capacity_ : kMaxElements;
+  const size_t capacity = std::max(needed, doubled);
+  // Not zeroed: every element below size_ is written before it is read.
+  auto values = std::make_unique_for_overwrite<float[]>(capacity);
+  if (size_) std::memcpy(values.get(), values_, size_ * sizeof(float));
+  owned_ = std::move(values);
+  values_ = owned_.get();
+  capacity_ = capacity;
+}
+
 void PBRepeatedFloat::assign(const float* values, size_t count) {
-  // A fresh vector, so `values` may point into the one it replaces.
   if (!values) count = 0;
-  std::vector<float>(values, values + count).swap(values_);
+  // A fresh array, so `values` may point into the one it replaces.
+  PBRepeatedFloat fresh;
+  if (count) std::memcpy(fresh.appendUninitialized(count), values, count * sizeof(float));
+  *this = std::move(fresh);
 }
 
 void PBRepeatedFloat::append(const PBRepeatedFloat& other) {
-  const size_t n = other.values_.size();
-  const size_t old = values_.size();
-  // After the resize other.values_ still starts with its n original elements
-  // even when it is values_, and [0, n) does not overlap [old, old + n).
-  values_.resize(old + n);
-  std::copy_n(other.values_.data(), n, values_.data() + old);
+  const size_t n = other.size_;
+  if (n == 0) return;
+  if (&other == this) {
+    // Growing may move the array; the first n elements are copied from
+    // wherever it ends up, and [0, n) does not overlap [n, 2n).
+    float* out = appendUninitialized(n);
+    std::memcpy(out, values_, n * sizeof(float));
+    return;
+  }
+  std::memcpy(appendUninitialized(n), other.values_, n * sizeof(float));
 }
 
 void PBRepeatedFloat::appendLittleEndian(const uint8_t* bytes, size_t count) {
-  const size_t old = values_.size();
-  values_.resize(old + count);
-  float* out = values_.data() + old;
+  if (count == 0) return;
+  float* out = appendUninitialized(count);
   if constexpr (std::endian::native == std::endian::little) {
-    if (count) std::memcpy(out, bytes, count * sizeof(float));
+    std::memcpy(out, bytes, count * sizeof(float));
   } else {
     for (size_t i = 0; i < count; ++i) out[i] = wire::loadFloat(bytes + 4 * i);
   }
-}
-
-void PBRepeatedFloat::appendStrided(const uint8_t* bytes, size_t count, size_t stride) {
-  const size_t old = values_.size();
-  values_.resize(old + count);
-  float* out = values_.data() + old;
-  for (size_t i = 0; i < count; ++i) out[i] = wire::loadFloat(bytes + i * stride);
 }
 
 bool PBRepeatedFloatIsEqual(const PBRepeatedFloat& a, const PBRepeatedFloat& b) {
