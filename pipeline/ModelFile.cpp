@@ -33,8 +33,17 @@ std::optional<std::string> BatteryModelDataHandler::getBatteryModelFilePath(uint
 
   char fileName[16];
   std::snprintf(fileName, sizeof fileName, "%x", chemID);
-  const NSURL url = *workingDirURL / "KVR" / "BatteryModels" / *deviceType /
-                    (std::string(fileName) + suffix + ".rcmodel");
+  const std::string name = std::string(fileName) + suffix + ".rcmodel";
+  // A device type that is one plain name joins the root as a string, which
+  // gives what appending path components gives, without their parsing.
+  const std::string& type = *deviceType;
+  if (!type.empty() && type.find('/') == std::string::npos && !workingDirURL->empty()) {
+    std::string path = workingDirURL->native();
+    if (path.back() != '/') path += '/';
+    path.append("KVR/BatteryModels/").append(type).append("/").append(name);
+    return path;
+  }
+  const NSURL url = *workingDirURL / "KVR" / "BatteryModels" / type / name;
   return url.string();
 }
 

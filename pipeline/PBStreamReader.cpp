@@ -31,9 +31,9 @@ NSError errnoError(const std::string& path, const char* what, int err) {
 
 }  // namespace
 
-std::optional<std::vector<uint8_t>> PBStreamReader::readFile(const std::string& path,
-                                                             NSError* error) {
-  auto fail = [&](NSError e) -> std::optional<std::vector<uint8_t>> {
+std::optional<PBStreamReader::FileContents> PBStreamReader::readFileContents(
+    const std::string& path, NSError* error) {
+  auto fail = [&](NSError e) -> std::optional<FileContents> {
     if (error) *error = std::move(e);
     return std::nullopt;
   };
@@ -48,18 +48,28 @@ std::optional<std::vector<uint8_t>> PBStreamReader::readFile(const std::string& 
                  std::to_string(kMaxFileSize) + "-byte limit for a model file"});
   }
   // One byte of room beyond the size seen, to notice a file that grew.
-  std::vector<uint8_t> bytes(static_cast<size_t>(st.st_size) + 1);
-  size_t filled = 0;
-  while (filled < bytes.size()) {
-    ssize_t n = ::read(fd.get(), bytes.data() + filled, bytes.size() - filled);
+  const size_t size = static_cast<size_t>(st.st_size);
+  FileContents file{std::make_unique_for_overwrite<uint8_t[]>(size + 1), 0};
+  while (file.size < size + 1) {
+    const size_t asked = size + 1 - file.size;
+    ssize_t n = ::read(fd.get(), file.data.get() + file.size, asked);
     if (n < 0 && errno == EINTR) continue;
     if (n < 0) return fail(errnoError(path, "cannot read", errno));
     if (n == 0) break;
-    filled += static_cast<size_t>(n);
+    file.size += static_cast<size_t>(n);
+    // A read of a regular file that stops short at the size seen has reached
+    // its end: the file is read in one call.
+    if (static_cast<size_t>(n) < asked && file.size == size) break;
   }
-  if (filled > static_cast<size_t>(st.st_size)) return fail({path + ": changed while being read"});
-  bytes.resize(filled);
-  return bytes;
+  if (file.size > size) return fail({path + ": changed while being read"});
+  return file;
+}
+
+std::optional<std::vector<uint8_t>> PBStreamReader::readFile(const std::string& path,
+                                                             NSError* error) {
+  std::optional<FileContents> file = readFileContents(path, error);
+  if (!file) return std::nullopt;
+  return std::vector<uint8_t>(file->data.get(), file->data.get() + file->size);
 }
 
 bool PBStreamReader::nextFrame(std::span<const uint8_t> bytes, size_t* offset,

@@ -25,8 +25,17 @@ class PBStreamReader {
   // Far above a full model (about 40 KB); anything larger is refused unread.
   static constexpr size_t kMaxFileSize = 4 * 1024 * 1024;
 
+  // A file's bytes, in a buffer that is not zeroed before they are read.
+  struct FileContents {
+    std::unique_ptr<uint8_t[]> data;
+    size_t size = 0;
+    std::span<const uint8_t> bytes() const { return {data.get(), size}; }
+  };
+
   // The whole file in one read, or an error when it cannot be opened, is not a
   // regular file or is larger than kMaxFileSize.
+  static std::optional<FileContents> readFileContents(const std::string& path, NSError* error);
+  // The same in a vector.
   static std::optional<std::vector<uint8_t>> readFile(const std::string& path, NSError* error);
 
   // The messages of `bytes` in order; an empty input is an empty list. On a
@@ -55,9 +64,9 @@ class PBStreamReader {
   template <typename Message>
   static std::optional<std::vector<std::shared_ptr<Message>>> readProtoBuffersOfClass(
       const std::string& path, NSError* error) {
-    std::optional<std::vector<uint8_t>> bytes = readFile(path, error);
-    if (!bytes) return std::nullopt;
-    auto messages = readProtoBuffersOfClass<Message>(std::span<const uint8_t>(*bytes), error);
+    std::optional<FileContents> file = readFileContents(path, error);
+    if (!file) return std::nullopt;
+    auto messages = readProtoBuffersOfClass<Message>(file->bytes(), error);
     if (!messages && error) error->localizedDescription = path + ": " + error->localizedDescription;
     return messages;
   }
