@@ -99,6 +99,23 @@ TEST(Defaults, FailsOnlyWhenTheDirectoryCannotBeMadeOrTheNameIsNoFileName) {
   EXPECT_TRUE(d->setInteger(1, "k"));
 }
 
+// For tools that look at the daemon's state without changing it.
+TEST(Defaults, AnExistingSuiteOpensForReadingOnlyAndNothingIsCreated) {
+  TempDir dir;
+  EXPECT_FALSE(NSUserDefaults::openExistingSuiteNamed(kSuite, dir.path() / "state"));
+  EXPECT_FALSE(NSUserDefaults::openExistingSuiteNamed(kSuite, dir.path()));
+  EXPECT_FALSE(std::filesystem::exists(dir.path() / "state"));
+
+  writeFile(dir.path() / "com.tesvar.kolvrand.json", R"({"savedBootUUID": "u"})");
+  auto d = NSUserDefaults::openExistingSuiteNamed(kSuite, dir.path());
+  ASSERT_TRUE(d);
+  EXPECT_EQ(d->stringForKey("savedBootUUID"), "u");
+  EXPECT_FALSE(d->setObject("v", "savedBootUUID"));
+  EXPECT_FALSE(d->removeObjectForKey("savedBootUUID"));
+  EXPECT_EQ(readFileText(d->path()), R"({"savedBootUUID": "u"})");
+  EXPECT_FALSE(std::filesystem::exists(dir.path() / "com.tesvar.kolvrand.json.lock"));
+}
+
 TEST(Defaults, TwoProcessesWritingDifferentKeysLoseNothing) {
   TempDir dir;
   constexpr int kWrites = 40;
