@@ -17,6 +17,7 @@
 
 #include "platform/Defaults.h"
 #include "platform/Log.h"
+#include "tests/support/DaemonProcess.h"
 
 namespace kolvrand {
 namespace {
@@ -130,6 +131,41 @@ TEST(CrashSafety, SettingsHoldOldOrNewValuesAfterAWriterIsKilled) {
   EXPECT_GT(mixed, 0);
   EXPECT_GT(allNew, 0);
   fs::remove_all(dir);
+}
+
+// The real daemon killed at random moments of its first start: the next
+// start finds whole settings and either skips (the upload had been confirmed
+// and recorded) or uploads again.
+TEST(CrashSafety, DaemonKilledDuringItsWorkRecoversAtTheNextStart) {
+  constexpr int kTrials = 40;
+  std::mt19937 rng(std::random_device{}());
+  std::uniform_int_distribution<int> delay(0, 60);
+  int skipped = 0, uploaded = 0;
+  for (int trial = 0; trial < kTrials; ++trial) {
+    SCOPED_TRACE("trial " + std::to_string(trial));
+    char pattern[] = "/tmp/kolvrand-kill.XXXXXX";
+    const fs::path dir = mkdtemp(pattern);
+    fs::copy(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device", dir, fs::copy_options::recursive);
+    {
+      test::DaemonProcess first(dir, "default");
+      std::this_thread::sleep_for(std::chrono::milliseconds(delay(rng)));
+      first.signal(SIGKILL);
+      first.waitForExit();
+    }
+    test::DaemonProcess second(dir, "default");
+    ASSERT_TRUE(second.waitForLine({"upload succeeded", "Skipping"})) << second.rawStderr();
+    second.signal(SIGTERM);
+    EXPECT_EQ(second.waitForExit(), 0);
+    const std::string out = second.rawStderr();
+    (out.find("Skipping") != std::string::npos ? skipped : uploaded)++;
+    std::ifstream in(dir / "state" / (std::string(kSuite) + ".json"));
+    const json state = json::parse(in, nullptr, false);
+    EXPECT_EQ(state.value("savedBootUUID", ""), "6f1c2b7e-3d4a-4e5f-9a1b-2c3d4e5f6a7b")
+        << state.dump();
+    fs::remove_all(dir);
+  }
+  std::printf("%d daemons killed: the next start skipped %d times, uploaded %d times\n", kTrials,
+              skipped, uploaded);
 }
 
 }  // namespace
