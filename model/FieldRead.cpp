@@ -1,6 +1,10 @@
 #include <bit>
 #include <cstring>
 
+#if defined(__x86_64__)
+#include <immintrin.h>
+#endif
+
 #include "model/FieldEngine.h"
 #include "model/PBCodable.h"
 
@@ -106,6 +110,63 @@ struct Run {
   uint64_t mask, pair;
 };
 
+#if defined(__x86_64__)
+// One-byte tags with the SSSE3 byte shuffle: sixteen bytes at an entry hold
+// three whole entries and the next entry's tag, so three values are tested
+// and gathered per load. Needs the first `fit` entries at p whole and room
+// for `fit` values at out.
+__attribute__((target("ssse3"))) size_t countAndCopyShuffled(float* out, const uint8_t* p,
+                                                             uint8_t tag, size_t fit) {
+  const __m128i gather = _mm_setr_epi8(1, 2, 3, 4, 6, 7, 8, 9, 11, 12, 13, 14, -1, -1, -1, -1);
+  const __m128i tags = _mm_set1_epi8(static_cast<char>(tag));
+  constexpr int kTagBits = 1 << 0 | 1 << 5 | 1 << 10;
+  size_t n = 0;
+  // Entries n .. n+5 are whole and n+6's tag follows, so both loads read
+  // inside the run, and the four values stored per load fit in out.
+  while (n + 7 <= fit) {
+    const __m128i a = _mm_loadu_si128(reinterpret_cast<const __m128i*>(p + 5 * n));
+    const __m128i b = _mm_loadu_si128(reinterpret_cast<const __m128i*>(p + 5 * n + 15));
+    const int same = _mm_movemask_epi8(_mm_cmpeq_epi8(a, tags)) &
+                     _mm_movemask_epi8(_mm_cmpeq_epi8(b, tags)) & kTagBits;
+    if (same != kTagBits) break;
+    _mm_storeu_si128(reinterpret_cast<__m128i*>(out + n), _mm_shuffle_epi8(a, gather));
+    _mm_storeu_si128(reinterpret_cast<__m128i*>(out + n + 3), _mm_shuffle_epi8(b, gather));
+    n += 6;
+  }
+  for (; n < fit && p[5 * n] == tag; ++n) out[n] = wire::loadFloat(p + 5 * n + 1);
+  return n;
+}
+
+// Two-byte tags: sixteen bytes at an entry hold two whole entries.
+__attribute__((target("ssse3"))) size_t countAndCopyShuffled2(float* out, const uint8_t* p,
+                                                              const uint8_t* tag, size_t fit) {
+  const __m128i gather = _mm_setr_epi8(2, 3, 4, 5, 8, 9, 10, 11, -1, -1, -1, -1, -1, -1, -1, -1);
+  const char t0 = static_cast<char>(tag[0]), t1 = static_cast<char>(tag[1]);
+  const __m128i tags = _mm_setr_epi8(t0, t1, 0, 0, 0, 0, t0, t1, 0, 0, 0, 0, 0, 0, 0, 0);
+  constexpr int kTagBits = 1 << 0 | 1 << 1 | 1 << 6 | 1 << 7;
+  size_t n = 0;
+  // Entries n .. n+4 are whole, so both loads read inside the run.
+  while (n + 5 <= fit) {
+    const __m128i a = _mm_loadu_si128(reinterpret_cast<const __m128i*>(p + 6 * n));
+    const __m128i b = _mm_loadu_si128(reinterpret_cast<const __m128i*>(p + 6 * n + 12));
+    const int same = _mm_movemask_epi8(_mm_cmpeq_epi8(a, tags)) &
+                     _mm_movemask_epi8(_mm_cmpeq_epi8(b, tags)) & kTagBits;
+    if (same != kTagBits) break;
+    _mm_storel_epi64(reinterpret_cast<__m128i*>(out + n), _mm_shuffle_epi8(a, gather));
+    _mm_storel_epi64(reinterpret_cast<__m128i*>(out + n + 2), _mm_shuffle_epi8(b, gather));
+    n += 4;
+  }
+  for (; n < fit && p[6 * n] == tag[0] && p[6 * n + 1] == tag[1]; ++n)
+    out[n] = wire::loadFloat(p + 6 * n + 2);
+  return n;
+}
+
+bool hasSSSE3() {
+  static const bool has = __builtin_cpu_supports("ssse3");
+  return has;
+}
+#endif
+
 // The rest of a run once its first value is read: `fit` whole entries follow
 // at `next`. An empty list fills the reader's shared array in one pass; any
 // other list counts the run, grows once and copies.
@@ -118,7 +179,17 @@ size_t readRunTail(PBDataReader& reader, MutableFields& fields, PBRepeatedFloat&
     float* room = reader.floatRoom(*fields.lentFloats, &available);
     if (room && available > fit) {
       room[0] = first;
+#if defined(__x86_64__)
+      size_t n;
+      if (!hasSSSE3())
+        n = run.countAndCopy(room + 1, next, fit);
+      else if constexpr (TagSize == 1)
+        n = countAndCopyShuffled(room + 1, next, tag[0], fit);
+      else
+        n = countAndCopyShuffled2(room + 1, next, tag, fit);
+#else
       const size_t n = run.countAndCopy(room + 1, next, fit);
+#endif
       reader.claimFloats(n + 1, *fields.lentFloats);
       list.lend(room, n + 1);
       list.appendUninitialized(n + 1);

@@ -134,5 +134,49 @@ TEST(DecodedLists, PackedAndUnpackedRunsOfOneFieldAccumulate) {
   EXPECT_EQ(list(m.gridOCVs(), m.gridOCVsCount()), (std::vector<float>{1, 2, 3, 4, 5}));
 }
 
+// Unpacked runs are read many entries at a time: every run length, with one-
+// and two-byte tags, cut at every byte, must give what reading the entries
+// one by one gives: each whole entry, then 0.0 and failure for an entry whose
+// tag is whole but whose value is cut.
+TEST(DecodedLists, UnpackedRunsOfEveryLengthCutAnywhere) {
+  for (uint32_t field : {1u, 19u}) {
+    for (size_t length = 1; length <= 17; ++length) {
+      std::vector<float> values(length);
+      for (size_t i = 0; i < length; ++i) values[i] = static_cast<float>(i) + 0.5f;
+      std::vector<uint8_t> bytes;
+      if (field == 1) {
+        OTAResistanceData t;
+        t.setResistance25Cs(values.data(), length);
+        bytes = t.data();
+      } else {
+        OTAParamRC m;
+        m.setGridOCVs(values.data(), length);
+        bytes = m.data();  // chemID (field 18), then the list
+      }
+      const size_t tagSize = field == 1 ? 1 : 2, stride = tagSize + 4;
+      const size_t start = bytes.size() - length * stride;
+      for (size_t cut = 0; cut <= length * stride; ++cut) {
+        const std::vector<uint8_t> prefix(bytes.begin(), bytes.begin() + start + cut);
+        std::vector<float> expected(values.begin(), values.begin() + cut / stride);
+        const bool cutValue = cut % stride >= tagSize;
+        if (cutValue) expected.push_back(0.0f);
+        std::vector<float> got;
+        bool ok;
+        if (field == 1) {
+          OTAResistanceData t;
+          ok = decode(t, prefix);
+          got = list(t.resistance25Cs(), t.resistance25CsCount());
+        } else {
+          OTAParamRC m;
+          ok = decode(m, prefix);
+          got = list(m.gridOCVs(), m.gridOCVsCount());
+        }
+        EXPECT_EQ(got, expected) << "field " << field << " length " << length << " cut " << cut;
+        EXPECT_EQ(ok, cut % stride == 0) << "field " << field << " length " << length;
+      }
+    }
+  }
+}
+
 }  // namespace
 }  // namespace kolvrand
