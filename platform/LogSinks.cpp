@@ -2,14 +2,15 @@
 #include "platform/Log.h"
 
 #include <sys/stat.h>
+#include <sys/uio.h>
 #include <unistd.h>
+#define SD_JOURNAL_SUPPRESS_LOCATION
+#include <systemd/sd-journal.h>
 
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <mutex>
-
-#include "platform/Journal.h"
 
 namespace kolvrand {
 
@@ -81,8 +82,17 @@ class JournalSink final : public LogSink {
     cat.append(category);
     std::string msg = "MESSAGE=";
     msg.append(withoutTrailingNewline(message));
-    const std::string_view fields[] = {priority, "SYSLOG_IDENTIFIER=kolvrand", sub, cat, msg};
-    if (platform::journalSend(fields) < 0) writeStderrLine(level, category, message);
+    static const char identifier[] = "SYSLOG_IDENTIFIER=kolvrand";
+    auto iov = [](const void* p, size_t n) { return iovec{const_cast<void*>(p), n}; };
+    const iovec fields[] = {
+        iov(priority, std::char_traits<char>::length(priority)),
+        iov(identifier, sizeof identifier - 1),
+        iov(sub.data(), sub.size()),
+        iov(cat.data(), cat.size()),
+        iov(msg.data(), msg.size()),
+    };
+    if (sd_journal_sendv(fields, static_cast<int>(std::size(fields))) < 0)
+      writeStderrLine(level, category, message);
   }
 };
 
@@ -91,7 +101,7 @@ class JournalSink final : public LogSink {
 // structured entries rather than bare lines. The native socket must exist
 // too: entries sent without it vanish without an error.
 bool stderrIsJournal() {
-  if (::access(platform::kJournalSocket, F_OK) != 0) return false;
+  if (::access("/run/systemd/journal/socket", F_OK) != 0) return false;
   const char* env = std::getenv("JOURNAL_STREAM");
   if (!env) return false;
   uintmax_t dev = 0, ino = 0;
