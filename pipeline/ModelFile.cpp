@@ -69,17 +69,17 @@ std::shared_ptr<OTAParamRC> BatteryModelDataHandler::loadProtobufModelWithFileNa
     return nullptr;
   }
   NSError error;
-  auto messages = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(*fileName, &error);
-  if (!messages) {
+  // Further messages in the file are checked but not used, nor kept.
+  auto first = PBStreamReader::readFirstProtoBufferOfClass<OTAParamRC>(*fileName, &error);
+  if (!first) {
     os_log_error(log_, "%s <Error> readContent error is %@", kMethod, error.localizedDescription);
     return nullptr;
   }
-  if (messages->empty()) {
+  if (!*first) {
     os_log_error(log_, "%s <Error> protobufModelRCParams nil", kMethod);
     return nullptr;
   }
-  // Further messages in the file are not used.
-  return std::move(messages->front());
+  return std::move(*first);
 }
 
 }  // namespace kolvrand

@@ -45,20 +45,29 @@ class PBStreamReader {
   static std::optional<std::vector<std::shared_ptr<Message>>> readProtoBuffersOfClass(
       std::span<const uint8_t> bytes, NSError* error) {
     std::vector<std::shared_ptr<Message>> messages;
-    size_t offset = 0;
-    while (offset < bytes.size()) {
-      const size_t start = offset;
-      std::span<const uint8_t> body;
-      if (!nextFrame(bytes, &offset, &body, messages.size(), error)) return std::nullopt;
-      auto message = std::make_shared<Message>();
-      PBDataReader reader(body.data(), body.size());
-      if (!message->readFrom(reader)) {
-        if (error) *error = messageError(messages.size(), start);
-        return std::nullopt;
-      }
-      messages.push_back(std::move(message));
-    }
+    if (!readEach<Message>(bytes, error,
+                           [&](std::shared_ptr<Message> m) { messages.push_back(std::move(m)); }))
+      return std::nullopt;
     return messages;
+  }
+
+  // The first message of the file at `path` (nullptr when it holds none).
+  // Every later message is decoded too, so a damaged one anywhere fails the
+  // read as above, but dropped at once: a file of millions of tiny messages
+  // costs time, never memory.
+  template <typename Message>
+  static std::optional<std::shared_ptr<Message>> readFirstProtoBufferOfClass(
+      const std::string& path, NSError* error) {
+    std::optional<FileContents> file = readFileContents(path, error);
+    if (!file) return std::nullopt;
+    std::shared_ptr<Message> first;
+    if (!readEach<Message>(file->bytes(), error, [&](std::shared_ptr<Message> m) {
+          if (!first) first = std::move(m);
+        })) {
+      if (error) error->localizedDescription = path + ": " + error->localizedDescription;
+      return std::nullopt;
+    }
+    return first;
   }
 
   template <typename Message>
@@ -72,6 +81,25 @@ class PBStreamReader {
   }
 
  private:
+  // Decodes the messages of `bytes` in order, handing each to `take`.
+  template <typename Message, typename Take>
+  static bool readEach(std::span<const uint8_t> bytes, NSError* error, Take&& take) {
+    size_t offset = 0;
+    for (size_t index = 0; offset < bytes.size(); ++index) {
+      const size_t start = offset;
+      std::span<const uint8_t> body;
+      if (!nextFrame(bytes, &offset, &body, index, error)) return false;
+      auto message = std::make_shared<Message>();
+      PBDataReader reader(body.data(), body.size());
+      if (!message->readFrom(reader)) {
+        if (error) *error = messageError(index, start);
+        return false;
+      }
+      take(std::move(message));
+    }
+    return true;
+  }
+
   // Reads the length of message `index` at *offset and returns its body;
   // *offset moves past the body.
   static bool nextFrame(std::span<const uint8_t> bytes, size_t* offset,

@@ -208,6 +208,30 @@ TEST(HostileModelFile, GroupsNestedAsDeepAsAllowedStillRead) {
       << testing::PrintToString(lines);
 }
 
+// Four million empty messages in a file within the cap: only the first is
+// kept, so the load costs time, not gigabytes (it took 6 GB when every
+// message was kept).
+TEST(HostileModelFile, MillionsOfEmptyMessagesCostNoMemory) {
+  Device device;
+  writeAll(device.path(kModel), std::string(PBStreamReader::kMaxFileSize, '\0'));
+  test::DaemonProcess daemon(device.dir(), "default");
+  ASSERT_TRUE(daemon.waitForLine({"Battery data upload failed"}, std::chrono::seconds(120)));
+  long peakKiB = 0;
+  {
+    std::ifstream status("/proc/" + std::to_string(daemon.pid()) + "/status");
+    for (std::string line; std::getline(status, line);)
+      if (line.starts_with("VmHWM:")) peakKiB = std::stol(line.substr(6));
+  }
+  // Under AddressSanitizer freed memory waits in a quarantine of 256 MiB.
+  EXPECT_GT(peakKiB, 0);
+  EXPECT_LT(peakKiB, 1024 * 1024) << "peak resident set in KiB";
+  daemon.signal(SIGTERM);
+  EXPECT_EQ(daemon.waitForExit(), 0);
+  // The daemon read it as the empty model it is.
+  EXPECT_TRUE(contains(daemon.lines(), "createKextModelFromProtobufModel:] <Error> r0 nil"))
+      << daemon.rawStderr();
+}
+
 // As root every file is readable, so the daemon runs as nobody, the way a
 // service without privileges would meet a model file it may not read.
 TEST(HostileModelFile, UnreadableIsRefused) {

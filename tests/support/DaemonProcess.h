@@ -65,6 +65,7 @@ class DaemonProcess {
   DaemonProcess& operator=(const DaemonProcess&) = delete;
 
   bool running() const { return running_; }
+  pid_t pid() const { return pid_; }
   void signal(int sig) const {
     if (running_) kill(pid_, sig);
   }
