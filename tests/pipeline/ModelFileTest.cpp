@@ -1,7 +1,6 @@
 // Finding and reading the model file: device type, path rules, and the stream
 // reader's refusals.
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <fstream>
 
@@ -132,8 +131,6 @@ TEST(PBStreamReader, FramingErrorsSayWhere) {
       {"\x05\x90\x01", std::nullopt,
        "message 0 at offset 0 claims 5 bytes but only 2 remain in "
        "the file"},
-      {std::string("\x80\x80\x80\x80\x80\x80\x80\x80\x80\x01", 10), std::nullopt,
-       "message 0 at offset 0 claims 9223372036854775808 bytes but only 0 remain in the file"},
       {std::string("\xff\xff\xff\xff\xff\xff\xff\xff\xff\x7f", 10), std::nullopt,
        "the length of message 0 at offset 0 is not a valid varint"},
       {one + "\x02\x90\x80", std::nullopt, "message 1 at offset 5 could not be decoded"},
@@ -150,33 +147,6 @@ TEST(PBStreamReader, FramingErrorsSayWhere) {
     }
     EXPECT_EQ(error.localizedDescription, c.error);
   }
-}
-
-TEST(PBStreamReader, RefusesWhatIsNotASmallRegularFile) {
-  char pattern[] = "/tmp/kolvrand-files.XXXXXX";
-  const fs::path dir = mkdtemp(pattern);
-  mkfifo((dir / "fifo").c_str(), 0600);
-  fs::create_symlink("loop", dir / "loop");
-  fs::create_directory(dir / "directory");
-  {
-    std::ofstream big(dir / "big", std::ios::binary);
-    big.seekp(PBStreamReader::kMaxFileSize);
-    big.put('\0');
-  }
-  const std::pair<const char*, std::string> cases[] = {
-      {"directory", "not a regular file"},
-      {"fifo", "not a regular file"},
-      {"loop", "cannot open: Too many levels of symbolic links"},
-      {"missing", "cannot open: No such file or directory"},
-      {"big", "4194305 bytes is larger than the 4194304-byte limit for a model file"},
-  };
-  for (const auto& [name, reason] : cases) {
-    SCOPED_TRACE(name);
-    NSError error;
-    EXPECT_FALSE(PBStreamReader::readFile((dir / name).string(), &error));
-    EXPECT_EQ(error.localizedDescription, (dir / name).string() + ": " + reason);
-  }
-  fs::remove_all(dir);
 }
 
 }  // namespace
