@@ -2,6 +2,7 @@
 // reads a model file, and turns the first message into the kernel record.
 // A stream that reads must survive being written out and read again, and a
 // refused one must say why.
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -48,15 +49,16 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   }
   check(messages->empty() == (size == 0));
 
+  // The first messages, written out as a stream, read back to the same bytes.
+  // Only the first: an input of thousands of empty messages would otherwise
+  // spend the run writing and rereading them.
+  const size_t checked = std::min<size_t>(messages->size(), 16);
   std::vector<uint8_t> rewritten;
-  for (const auto& m : *messages) appendDelimited(rewritten, m->data());
+  for (size_t i = 0; i < checked; ++i) appendDelimited(rewritten, (*messages)[i]->data());
   auto again = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(
       std::span<const uint8_t>(rewritten), &error);
-  check(again && again->size() == messages->size());
-  // Bytes, not dictionaries: a write is exact, and comparing dictionaries of
-  // full-size models would dominate the run time.
-  for (size_t i = 0; i < messages->size(); ++i)
-    check((*again)[i]->data() == (*messages)[i]->data());
+  check(again && again->size() == checked);
+  for (size_t i = 0; i < checked; ++i) check((*again)[i]->data() == (*messages)[i]->data());
 
   if (messages->empty()) return 0;
   // A model that fills the record goes on to the builder, whose copies the
