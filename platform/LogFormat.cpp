@@ -95,7 +95,10 @@ struct Directive {
     for (char c : flags)
       if (allowedFlags.find(c) != std::string_view::npos) f += c;
     if (width >= 0) f += std::to_string(width);
-    if (withPrecision && precision >= 0) f += "." + std::to_string(precision);
+    if (withPrecision && precision >= 0) {
+      f += '.';
+      f += std::to_string(precision);
+    }
     f.append(lengthModifier);
     f += conv;
     return f;

@@ -163,7 +163,10 @@ bool writeOutput(const std::string& command, const std::string& path, std::strin
   const fs::path target(path);
   fs::path dir = target.parent_path();
   if (dir.empty()) dir = ".";
-  std::string temporary = (dir / ("." + target.filename().string() + ".XXXXXX")).string();
+  std::string name = ".";
+  name += target.filename().string();
+  name += ".XXXXXX";
+  std::string temporary = (dir / name).string();
   int fd = ::mkstemp(temporary.data());
   if (fd < 0) {
     error(command, path + ": cannot write: " + std::strerror(errno));
