@@ -80,36 +80,31 @@
     fields_.ints[Slots::name] = value;                \
   }
 
+// The setter, which sets the has-bit, and the has-bit's own accessors.
+#define KVR_OPTIONAL_ACCESSORS(name, Name, bit, Type, storage)                                \
+  void set##Name(Type value) {                                                                \
+    fields_.storage[Slots::name] = static_cast<decltype(fields_.storage)::value_type>(value); \
+    fields_.setHasBit(bit, true);                                                             \
+  }                                                                                           \
+  void setHas##Name(bool value) {                                                             \
+    fields_.setHasBit(bit, value);                                                            \
+  }                                                                                           \
+  bool has##Name() const {                                                                    \
+    return fields_.hasBit(bit);                                                               \
+  }
+
 #define KVR_FLOAT_ACCESSORS(number, name, Name, key, bit) \
   float name() const {                                    \
     return fields_.floats[Slots::name];                   \
   }                                                       \
-  void set##Name(float value) {                           \
-    fields_.floats[Slots::name] = value;                  \
-    fields_.setHasBit(bit, true);                         \
-  }                                                       \
-  void setHas##Name(bool value) {                         \
-    fields_.setHasBit(bit, value);                        \
-  }                                                       \
-  bool has##Name() const {                                \
-    return fields_.hasBit(bit);                           \
-  }
+  KVR_OPTIONAL_ACCESSORS(name, Name, bit, float, floats)
 
 // The getter reads 0 while the bit is clear, whatever value is stored.
 #define KVR_ENUM_ACCESSORS(number, name, Name, key, bit)                          \
   int32_t name() const {                                                          \
     return has##Name() ? static_cast<int32_t>(fields_.ints[Slots::name]) : 0;     \
   }                                                                               \
-  void set##Name(int32_t value) {                                                 \
-    fields_.ints[Slots::name] = static_cast<uint32_t>(value);                     \
-    fields_.setHasBit(bit, true);                                                 \
-  }                                                                               \
-  void setHas##Name(bool value) {                                                 \
-    fields_.setHasBit(bit, value);                                                \
-  }                                                                               \
-  bool has##Name() const {                                                        \
-    return fields_.hasBit(bit);                                                   \
-  }                                                                               \
+  KVR_OPTIONAL_ACCESSORS(name, Name, bit, int32_t, ints)                          \
   /* The value's name, or "(unknown: %i)". */                                     \
   static std::string name##AsString(int32_t value);                               \
   /* The value named exactly by `string`; 0 for any other string and for none. */ \

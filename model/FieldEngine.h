@@ -26,14 +26,17 @@ bool readFields(const MessageTable& table, MutableFields fields, PBDataReader& r
 void writeFields(const MessageTable& table, ConstFields fields, PBDataWriter& writer);
 size_t encodedFieldsSize(const MessageTable& table, ConstFields fields);
 
-// copyTo: the target shares the source's sub-messages and takes its non-empty
-// lists, chemID-like values and set optional values; the rest stays.
-void copyFields(const MessageTable& table, ConstFields from, MutableFields to);
-// Into a new message: an independent tree of exactly the source's present fields.
-void deepCopyFields(const MessageTable& table, ConstFields from, MutableFields to);
-// mergeFrom: sub-messages merged recursively (or shared when the target has
-// none), lists appended, set values overwritten.
-void mergeFields(const MessageTable& table, ConstFields from, MutableFields to);
+enum class Transfer {
+  // copyTo: the target shares the source's sub-messages and takes its
+  // non-empty lists, chemID-like values and set optional values; the rest stays.
+  Copy,
+  // Into a new message: an independent tree of exactly the source's present fields.
+  DeepCopy,
+  // mergeFrom: sub-messages merged recursively (or shared when the target has
+  // none), lists appended, set values overwritten.
+  Merge,
+};
+void transferFields(const MessageTable& table, ConstFields from, MutableFields to, Transfer how);
 
 bool equalFields(const MessageTable& table, ConstFields a, ConstFields b);
 uint64_t hashFields(const MessageTable& table, ConstFields fields);

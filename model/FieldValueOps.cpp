@@ -10,26 +10,29 @@ int32_t asInt32(uint32_t stored) {
   return static_cast<int32_t>(stored);
 }
 
-// Copies a set optional value with its bit; a clear bit leaves the target's.
-void copyIfSet(const FieldDescriptor& d, ConstFields from, MutableFields to) {
-  if (!(from.has & d.hasMask())) return;
-  if (d.kind == FieldKind::OptionalFloat)
-    to.floats[d.slot] = from.floats[d.slot];
-  else
-    to.ints[d.slot] = from.ints[d.slot];
-  *to.has |= d.hasMask();
-}
-
 }  // namespace
 
-void copyFields(const MessageTable& table, ConstFields from, MutableFields to) {
+void transferFields(const MessageTable& table, ConstFields from, MutableFields to, Transfer how) {
   for (const FieldDescriptor *d = table.fields, *end = d + table.count; d != end; ++d) {
     switch (d->kind) {
-      case FieldKind::SubMessage:
-        if (from.subs[d->slot]) to.subs[d->slot] = from.subs[d->slot];
+      case FieldKind::SubMessage: {
+        const auto& source = from.subs[d->slot];
+        if (!source) break;
+        auto& target = to.subs[d->slot];
+        if (how == Transfer::DeepCopy)
+          target = source->copyMessage();
+        else if (how == Transfer::Merge && target)
+          // Merging into a present sub-message changes that object in place,
+          // so every parent sharing it sees the change.
+          target->mergeFromMessage(*source);
+        else
+          target = source;
         break;
+      }
       case FieldKind::RepeatedFloat:
-        if (!from.lists[d->slot].empty())
+        if (how == Transfer::Merge)
+          to.lists[d->slot].append(from.lists[d->slot]);
+        else if (how == Transfer::DeepCopy || !from.lists[d->slot].empty())
           PBRepeatedFloatCopy(to.lists[d->slot], from.lists[d->slot]);
         break;
       case FieldKind::Uint32:
@@ -37,54 +40,13 @@ void copyFields(const MessageTable& table, ConstFields from, MutableFields to) {
         break;
       case FieldKind::OptionalFloat:
       case FieldKind::OptionalEnum:
-        copyIfSet(*d, from, to);
-        break;
-    }
-  }
-}
-
-void deepCopyFields(const MessageTable& table, ConstFields from, MutableFields to) {
-  for (const FieldDescriptor *d = table.fields, *end = d + table.count; d != end; ++d) {
-    switch (d->kind) {
-      case FieldKind::SubMessage:
-        if (const auto& message = from.subs[d->slot]) to.subs[d->slot] = message->copyMessage();
-        break;
-      case FieldKind::RepeatedFloat:
-        PBRepeatedFloatCopy(to.lists[d->slot], from.lists[d->slot]);
-        break;
-      case FieldKind::Uint32:
-        to.ints[d->slot] = from.ints[d->slot];
-        break;
-      case FieldKind::OptionalFloat:
-      case FieldKind::OptionalEnum:
-        copyIfSet(*d, from, to);
-        break;
-    }
-  }
-}
-
-void mergeFields(const MessageTable& table, ConstFields from, MutableFields to) {
-  for (const FieldDescriptor *d = table.fields, *end = d + table.count; d != end; ++d) {
-    switch (d->kind) {
-      case FieldKind::SubMessage:
-        // Merging into a present sub-message changes that object in place, so
-        // every parent sharing it sees the change.
-        if (const auto& source = from.subs[d->slot]) {
-          if (auto& target = to.subs[d->slot])
-            target->mergeFromMessage(*source);
-          else
-            target = source;
-        }
-        break;
-      case FieldKind::RepeatedFloat:
-        to.lists[d->slot].append(from.lists[d->slot]);
-        break;
-      case FieldKind::Uint32:
-        to.ints[d->slot] = from.ints[d->slot];
-        break;
-      case FieldKind::OptionalFloat:
-      case FieldKind::OptionalEnum:
-        copyIfSet(*d, from, to);
+        // A set value is copied with its bit; a clear bit leaves the target's.
+        if (!(from.has & d->hasMask())) break;
+        if (d->kind == FieldKind::OptionalFloat)
+          to.floats[d->slot] = from.floats[d->slot];
+        else
+          to.ints[d->slot] = from.ints[d->slot];
+        *to.has |= d->hasMask();
         break;
     }
   }

@@ -52,18 +52,21 @@ class GeneratedMessage : public PBCodable {
   }
 
   // The target shares this message's sub-messages (a later change through
-  // either parent shows in both); see copyFields.
+  // either parent shows in both); see Transfer::Copy.
   void copyTo(Derived& target) const {
-    copyFields(Derived::table(), fields_.view(), target.GeneratedMessage::fields_.view());
+    transferFields(Derived::table(), fields_.view(), target.GeneratedMessage::fields_.view(),
+                   Transfer::Copy);
   }
   // An independent deep copy.
   std::shared_ptr<Derived> copy() const {
     auto result = std::make_shared<Derived>();
-    deepCopyFields(Derived::table(), fields_.view(), result->GeneratedMessage::fields_.view());
+    transferFields(Derived::table(), fields_.view(), result->GeneratedMessage::fields_.view(),
+                   Transfer::DeepCopy);
     return result;
   }
   void mergeFrom(const Derived& source) {
-    mergeFields(Derived::table(), source.GeneratedMessage::fields_.view(), fields_.view());
+    transferFields(Derived::table(), source.GeneratedMessage::fields_.view(), fields_.view(),
+                   Transfer::Merge);
   }
 
   std::shared_ptr<PBCodable> copyMessage() const override { return copy(); }

@@ -35,20 +35,6 @@ std::optional<Dictionary> copyBatteryData(const os_log_t& log, const char* metho
 
 }  // namespace
 
-std::shared_ptr<BatteryModelDataHandler> BatteryModelDataHandler::sharedInstance() {
-  static dispatch_once_t once;
-  static std::shared_ptr<BatteryModelDataHandler> shared;
-  dispatch_once(&once, [] { shared = init(); });
-  return shared;
-}
-
-std::shared_ptr<BatteryModelDataHandler> BatteryModelDataHandler::init() {
-  auto handler = std::make_shared<BatteryModelDataHandler>();
-  handler->setDefaults(NSUserDefaults::initWithSuiteName(DaemonIdentifier));
-  handler->setLog(os_log_create(DaemonIdentifier, "batteryModelDataHandling"));
-  return handler;
-}
-
 int32_t BatteryModelDataHandler::getIntValueForKeyFromBatteryData(const char* key) {
   static constexpr const char* kMethod =
       "-[BatteryModelDataHandler getIntValueForKeyFromBatteryData:]";

@@ -7,8 +7,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Defaults.h"
-#include "platform/Log.h"
+#include "pipeline/DaemonAgent.h"
 #include "platform/Value.h"
 
 namespace kolvrand {
@@ -16,13 +15,12 @@ namespace kolvrand {
 class OTAParamRC;
 struct KextBatteryModel;
 
-class BatteryModelDataHandler {
+class BatteryModelDataHandler : public DaemonAgent<BatteryModelDataHandler> {
  public:
-  // The one shared handler, created on first use under a once-only guard.
-  static std::shared_ptr<BatteryModelDataHandler> sharedInstance();
-  // A handler with its own defaults (suite DaemonIdentifier; nil when the
-  // suite cannot be opened) and its "batteryModelDataHandling" log.
-  static std::shared_ptr<BatteryModelDataHandler> init();
+  // A handler with its own defaults and its "batteryModelDataHandling" log.
+  static std::shared_ptr<BatteryModelDataHandler> init() {
+    return make("batteryModelDataHandling");
+  }
 
   // Battery identity, from the battery driver's "BatteryData".
   int32_t getIntValueForKeyFromBatteryData(const char* key);
@@ -46,19 +44,6 @@ class BatteryModelDataHandler {
   // Stores an owned copy of the driver's "KVRVector" dictionary in *dict.
   bool getKVRDebugDict(std::optional<Dictionary>* dict);
   bool verifyHashData(const uint8_t* sentHash);
-
-  // Kept for the driver interface's symmetry; nothing calls them.
-  bool setBatteryModelDataToDisk() { return true; }
-  bool getBatteryModelDataFromKernel() { return true; }
-
-  const std::shared_ptr<NSUserDefaults>& defaults() const { return defaults_; }
-  void setDefaults(std::shared_ptr<NSUserDefaults> d) { defaults_ = std::move(d); }
-  const os_log_t& log() const { return log_; }
-  void setLog(os_log_t l) { log_ = std::move(l); }
-
- private:
-  std::shared_ptr<NSUserDefaults> defaults_;
-  os_log_t log_;
 };
 
 }  // namespace kolvrand

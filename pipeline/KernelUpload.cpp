@@ -12,7 +12,8 @@ namespace kolvrand {
 
 namespace {
 
-constexpr uint32_t kSetBatteryParamsSelector = 24;
+using namespace kvr_driver;
+static_assert(sizeof(KextBatteryModel) == kBatteryParamsSize);
 
 // Closes the user-client connection on every way out of the upload.
 class ConnectionGuard {
@@ -46,7 +47,7 @@ bool BatteryModelDataHandler::setBatteryModelDataToKernel(const KextBatteryModel
   CC_SHA1_Final(sentHash.data(), &context);
 
   io_service_t service =
-      IOServiceGetMatchingService(kIOMasterPortDefault, IOServiceMatching("TesvarKVR"));
+      IOServiceGetMatchingService(kIOMasterPortDefault, IOServiceMatching(kServiceClass));
   if (!service) {
     os_log_error(log_, "%s <Error> no io service get matched", kMethod);
     return false;
@@ -85,12 +86,12 @@ bool BatteryModelDataHandler::verifyHashData(const uint8_t* sentHash) {
     return false;
   }
   // Entries of another type than the driver's contract count as absent.
-  const Value* battModel = kvrVector->find("KVRBatteryModel");
+  const Value* battModel = kvrVector->find(kBatteryModelKey);
   if (!battModel || !battModel->isDictionary()) {
     os_log_error(log_, "%s <Error> battModelDict nil", kMethod);
     return false;
   }
-  const Value* published = battModel->asDictionary()->find("RCParamsHash");
+  const Value* published = battModel->asDictionary()->find(kParamsHashKey);
   if (!published || !published->isData()) {
     os_log_error(log_, "%s <Error> RCParamsHash nil", kMethod);
     return false;
@@ -111,9 +112,9 @@ bool BatteryModelDataHandler::verifyHashData(const uint8_t* sentHash) {
 
 bool BatteryModelDataHandler::getKVRDebugDict(std::optional<Dictionary>* dict) {
   io_service_t service =
-      IOServiceGetMatchingService(kIOMasterPortDefault, IOServiceMatching("TesvarKVR"));
+      IOServiceGetMatchingService(kIOMasterPortDefault, IOServiceMatching(kServiceClass));
   if (!service) return false;
-  std::optional<Value> kvrVector = IORegistryEntryCreateCFProperty(service, "KVRVector");
+  std::optional<Value> kvrVector = IORegistryEntryCreateCFProperty(service, kVectorProperty);
   if (!kvrVector || !kvrVector->isDictionary()) return false;
   *dict = std::move(*kvrVector->asDictionary());
   return true;

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "model/PBDataReader.h"
+#include "platform/FileManager.h"
 
 namespace kolvrand {
 
@@ -25,12 +26,7 @@ class PBStreamReader {
   // Far above a full model (about 40 KB); anything larger is refused unread.
   static constexpr size_t kMaxFileSize = 4 * 1024 * 1024;
 
-  // A file's bytes, in a buffer that is not zeroed before they are read.
-  struct FileContents {
-    std::unique_ptr<uint8_t[]> data;
-    size_t size = 0;
-    std::span<const uint8_t> bytes() const { return {data.get(), size}; }
-  };
+  using FileContents = kolvrand::FileContents;
 
   // The whole file in one read, or an error when it cannot be opened, is not a
   // regular file or is larger than kMaxFileSize.

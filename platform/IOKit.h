@@ -31,6 +31,19 @@ inline constexpr mach_port_t kIOMasterPortDefault = 0;
 
 task_port_t mach_task_self();
 
+// The battery-model driver's contract, shared by the upload and the simulated
+// driver: its service class, the selector of its "setBatteryParams" method,
+// the size of the record that method takes, and the property under which it
+// publishes the record's SHA-1 (kBatteryModelKey / kParamsHashKey within it).
+namespace kvr_driver {
+inline constexpr const char* kServiceClass = "TesvarKVR";
+inline constexpr uint32_t kSetBatteryParamsSelector = 24;
+inline constexpr size_t kBatteryParamsSize = 29056;
+inline constexpr const char* kVectorProperty = "KVRVector";
+inline constexpr const char* kBatteryModelKey = "KVRBatteryModel";
+inline constexpr const char* kParamsHashKey = "RCParamsHash";
+}  // namespace kvr_driver
+
 struct IOMatchingDictionary {
   std::string className;
 };

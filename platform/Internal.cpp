@@ -106,18 +106,6 @@ bool writeFileAtomically(const std::filesystem::path& path, std::string_view byt
   return true;
 }
 
-std::string toHex(const void* data, size_t len) {
-  static const char* digits = "0123456789abcdef";
-  const auto* p = static_cast<const unsigned char*>(data);
-  std::string out;
-  out.reserve(len * 2);
-  for (size_t i = 0; i < len; ++i) {
-    out += digits[p[i] >> 4];
-    out += digits[p[i] & 15];
-  }
-  return out;
-}
-
 std::optional<std::string> fromHex(std::string_view hex) {
   auto nibble = [](char c) -> int {
     if (c >= '0' && c <= '9') return c - '0';

@@ -26,7 +26,6 @@ std::optional<std::string> readFile(const std::filesystem::path& path, int* err 
 bool writeFileAtomically(const std::filesystem::path& path, std::string_view bytes,
                          std::string* error);
 
-std::string toHex(const void* data, size_t len);
 // Even-length hexadecimal text of either case; nullopt on anything else.
 std::optional<std::string> fromHex(std::string_view hex);
 

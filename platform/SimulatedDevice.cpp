@@ -22,10 +22,7 @@ namespace kolvrand::platform {
 
 namespace {
 
-constexpr std::string_view kDriverClass = "TesvarKVR";
-constexpr std::string_view kHashProperty = "KVRVector";
-constexpr uint32_t kSetBatteryParamsSelector = 24;
-constexpr size_t kBatteryParamsSize = 29056;
+using namespace kvr_driver;
 
 class SimulatedDevice final : public Backend, public KernelVariables, public Registry {
  public:
@@ -66,7 +63,7 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
     const auto* entry = serviceEntry(service);
     if (!entry || entry->absent.contains(key)) return std::nullopt;
     if (const Value* v = entry->properties.find(key)) return *v;
-    if (entry->name == kDriverClass && key == kHashProperty) return publishedHash();
+    if (entry->name == kServiceClass && key == kVectorProperty) return publishedHash();
     return std::nullopt;
   }
 
@@ -75,7 +72,7 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
     *connection = 0;
     const auto* entry = serviceEntry(service);
     if (!entry || type != 0) return kIOReturnBadArgument;
-    if (entry->name != kDriverClass) return kIOReturnUnsupported;
+    if (entry->name != kServiceClass) return kIOReturnUnsupported;
     if (openResult_ != 0) return openResult_;
     std::lock_guard lock(mutex_);
     uint32_t id = nextConnection_++;
@@ -131,7 +128,7 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
     if (!bytes) return std::nullopt;
     SHA1Digest digest = sha1(bytes->data(), bytes->size());
     return Value(Dictionary{
-        {"KVRBatteryModel", Dictionary{{"RCParamsHash", Data(digest.begin(), digest.end())}}}});
+        {kBatteryModelKey, Dictionary{{kParamsHashKey, Data(digest.begin(), digest.end())}}}});
   }
 
   static bool fail(std::string* error, std::string what) {

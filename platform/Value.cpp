@@ -46,64 +46,14 @@ void appendQuoted(std::string& out, std::string_view s) {
         break;
       default:
         if (c < 0x20) {
-          static const char* hex = "0123456789abcdef";
           out += "\\u00";
-          out += hex[c >> 4];
-          out += hex[c & 15];
+          out += hexString(&c, 1);
         } else {
           out += static_cast<char>(c);
         }
     }
   }
   out += '"';
-}
-
-void describe(std::string& out, const Value& v) {
-  switch (v.type()) {
-    case Value::Type::Boolean:
-      out += *v.asBoolean() ? "true" : "false";
-      break;
-    case Value::Type::Number:
-      out += v.asNumber()->description();
-      break;
-    case Value::Type::String:
-      appendQuoted(out, *v.asString());
-      break;
-    case Value::Type::Data: {
-      static const char* hex = "0123456789abcdef";
-      out += '<';
-      for (uint8_t b : *v.asData()) {
-        out += hex[b >> 4];
-        out += hex[b & 15];
-      }
-      out += '>';
-      break;
-    }
-    case Value::Type::Array: {
-      out += '[';
-      bool first = true;
-      for (const Value& e : *v.asArray()) {
-        if (!first) out += ", ";
-        first = false;
-        describe(out, e);
-      }
-      out += ']';
-      break;
-    }
-    case Value::Type::Dictionary: {
-      out += '{';
-      bool first = true;
-      for (const auto& [k, e] : *v.asDictionary()) {
-        if (!first) out += ", ";
-        first = false;
-        appendQuoted(out, k);
-        out += ": ";
-        describe(out, e);
-      }
-      out += '}';
-      break;
-    }
-  }
 }
 
 }  // namespace
@@ -222,9 +172,69 @@ bool Dictionary::operator==(const Dictionary& other) const {
   return true;
 }
 
-std::string Value::description() const {
+std::string hexString(const uint8_t* bytes, size_t size) {
+  static constexpr char kDigits[] = "0123456789abcdef";
   std::string out;
-  describe(out, *this);
+  out.reserve(size * 2);
+  for (size_t i = 0; i < size; ++i) {
+    out += kDigits[bytes[i] >> 4];
+    out += kDigits[bytes[i] & 15];
+  }
+  return out;
+}
+
+void renderValue(std::string& out, const Value& value, const ValueTextStyle& style) {
+  switch (value.type()) {
+    case Value::Type::Boolean:
+      out += *value.asBoolean() ? "true" : "false";
+      break;
+    case Value::Type::Number:
+      style.number(out, *value.asNumber());
+      break;
+    case Value::Type::String:
+      style.string(out, *value.asString());
+      break;
+    case Value::Type::Data:
+      out += style.dataOpen;
+      out += hexString(value.asData()->data(), value.asData()->size());
+      out += style.dataClose;
+      break;
+    case Value::Type::Array: {
+      out += '[';
+      bool first = true;
+      for (const Value& element : *value.asArray()) {
+        if (!first) out += style.elementSeparator;
+        first = false;
+        renderValue(out, element, style);
+      }
+      out += ']';
+      break;
+    }
+    case Value::Type::Dictionary: {
+      out += '{';
+      bool first = true;
+      for (const auto& [key, element] : *value.asDictionary()) {
+        if (!first) out += style.elementSeparator;
+        first = false;
+        style.string(out, key);
+        out += style.keySeparator;
+        renderValue(out, element, style);
+      }
+      out += '}';
+      break;
+    }
+  }
+}
+
+std::string Value::description() const {
+  static constexpr ValueTextStyle kReadable{", ",
+                                            ": ",
+                                            "<",
+                                            ">",
+                                            [](std::string& out, const Number& n) { out += n.description(); },
+                                            appendQuoted};
+  std::string out;
+  renderValue(out, *this, kReadable);
   return out;
 }
 

@@ -145,4 +145,21 @@ inline std::vector<Dictionary::Entry>::const_iterator Dictionary::end() const {
   return entries_.end();
 }
 
+// Lower-case hexadecimal, two digits a byte.
+std::string hexString(const uint8_t* bytes, size_t size);
+
+// How renderValue writes a value in JSON's shape: what stands between the
+// elements of an array or object and between a key and its value, what
+// encloses a byte string's hexadecimal digits, and how numbers and strings
+// (keys too) are written.
+struct ValueTextStyle {
+  std::string_view elementSeparator;
+  std::string_view keySeparator;
+  std::string_view dataOpen;
+  std::string_view dataClose;
+  void (*number)(std::string& out, const Number& number);
+  void (*string)(std::string& out, std::string_view string);
+};
+void renderValue(std::string& out, const Value& value, const ValueTextStyle& style);
+
 }  // namespace kolvrand

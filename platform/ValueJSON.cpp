@@ -95,41 +95,4 @@ std::optional<Value> parseValueJSON(std::string_view text, std::string* error) {
   return valueFromJSON(j, error);
 }
 
-JSON valueToJSON(const Value& value) {
-  switch (value.type()) {
-    case Value::Type::Boolean:
-      return *value.asBoolean();
-    case Value::Type::Number: {
-      const Number& n = *value.asNumber();
-      switch (n.kind()) {
-        case Number::Kind::Signed:
-          return n.int64Value();
-        case Number::Kind::Unsigned:
-          return n.uint64Value();
-        case Number::Kind::Float:
-        case Number::Kind::Double:
-          return n.doubleValue();
-      }
-      return nullptr;
-    }
-    case Value::Type::String:
-      return *value.asString();
-    case Value::Type::Data: {
-      const Data& d = *value.asData();
-      return JSON{{"$data", toHex(d.data(), d.size())}};
-    }
-    case Value::Type::Array: {
-      JSON a = JSON::array();
-      for (const Value& e : *value.asArray()) a.push_back(valueToJSON(e));
-      return a;
-    }
-    case Value::Type::Dictionary: {
-      JSON o = JSON::object();
-      for (const auto& [k, e] : *value.asDictionary()) o[k] = valueToJSON(e);
-      return o;
-    }
-  }
-  return nullptr;
-}
-
 }  // namespace kolvrand::platform

@@ -21,6 +21,4 @@ std::optional<Value> valueFromJSON(const JSON& json, std::string* error = nullpt
 // The same from text; a syntax error is an error too.
 std::optional<Value> parseValueJSON(std::string_view text, std::string* error = nullptr);
 
-JSON valueToJSON(const Value& value);
-
 }  // namespace kolvrand::platform

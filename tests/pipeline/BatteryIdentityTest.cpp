@@ -98,13 +98,5 @@ TEST(BatteryIdentity, SerialNumberSuffixOfChemID5640) {
   }
 }
 
-TEST(BatteryModelDataHandler, SharedInstanceIsOneObject) {
-  auto a = BatteryModelDataHandler::sharedInstance();
-  ASSERT_TRUE(a);
-  EXPECT_EQ(a, BatteryModelDataHandler::sharedInstance());
-  EXPECT_TRUE(a->setBatteryModelDataToDisk());
-  EXPECT_TRUE(a->getBatteryModelDataFromKernel());
-}
-
 }  // namespace
 }  // namespace kolvrand

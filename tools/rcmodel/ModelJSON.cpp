@@ -20,76 +20,35 @@ std::string shortest(T value) {
   return std::string(buffer, result.ptr);
 }
 
-std::string quoted(const std::string& s) {
-  return JSON(s).dump(-1, ' ', false, JSON::error_handler_t::replace);
-}
-
-void render(const Value& value, std::string& out) {
-  switch (value.type()) {
-    case Value::Type::Boolean:
-      out += *value.asBoolean() ? "true" : "false";
+void renderNumber(std::string& out, const Number& n) {
+  switch (n.kind()) {
+    case Number::Kind::Signed:
+      out += std::to_string(n.int64Value());
       return;
-    case Value::Type::Number: {
-      const Number& n = *value.asNumber();
-      switch (n.kind()) {
-        case Number::Kind::Signed:
-          out += std::to_string(n.int64Value());
-          return;
-        case Number::Kind::Unsigned:
-          out += std::to_string(n.uint64Value());
-          return;
-        case Number::Kind::Float:
-          out += floatJSON(n.floatValue());
-          return;
-        case Number::Kind::Double: {
-          const double d = n.doubleValue();
-          if (std::isnan(d) || std::isinf(d) || (d == 0 && std::signbit(d)))
-            out += floatJSON(static_cast<float>(d));
-          else
-            out += shortest(d);
-          return;
-        }
-      }
+    case Number::Kind::Unsigned:
+      out += std::to_string(n.uint64Value());
       return;
-    }
-    case Value::Type::String:
-      out += quoted(*value.asString());
+    case Number::Kind::Float:
+      out += floatJSON(n.floatValue());
       return;
-    case Value::Type::Data: {
-      static const char kHex[] = "0123456789abcdef";
-      out += '"';
-      for (uint8_t b : *value.asData()) {
-        out += kHex[b >> 4];
-        out += kHex[b & 15];
-      }
-      out += '"';
-      return;
-    }
-    case Value::Type::Array: {
-      out += '[';
-      bool first = true;
-      for (const Value& element : *value.asArray()) {
-        if (!first) out += ',';
-        first = false;
-        render(element, out);
-      }
-      out += ']';
-      return;
-    }
-    case Value::Type::Dictionary: {
-      out += '{';
-      bool first = true;
-      for (const auto& [key, element] : *value.asDictionary()) {
-        if (!first) out += ',';
-        first = false;
-        out += quoted(key);
-        out += ':';
-        render(element, out);
-      }
-      out += '}';
+    case Number::Kind::Double: {
+      const double d = n.doubleValue();
+      if (std::isnan(d) || std::isinf(d) || (d == 0 && std::signbit(d)))
+        out += floatJSON(static_cast<float>(d));
+      else
+        out += shortest(d);
       return;
     }
   }
+}
+
+void renderString(std::string& out, std::string_view s) {
+  out += JSON(s).dump(-1, ' ', false, JSON::error_handler_t::replace);
+}
+
+void render(const Value& value, std::string& out) {
+  static constexpr ValueTextStyle kJSON{",", ":", "\"", "\"", renderNumber, renderString};
+  renderValue(out, value, kJSON);
 }
 
 // Builds a Value from the parser's events, keeping the path of every value

@@ -61,7 +61,7 @@ int runRecord(const std::vector<std::string>& args) {
                                                 sizeof(KextBatteryModel))))
     return kExitFailed;
   std::FILE* out = a.output == "-" ? stderr : stdout;
-  std::fprintf(out, "%s\n", hex(digest.data(), digest.size()).c_str());
+  std::fprintf(out, "%s\n", hexString(digest.data(), digest.size()).c_str());
   return kExitOK;
 }
 

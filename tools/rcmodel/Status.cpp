@@ -128,12 +128,13 @@ int runStatus(const std::vector<std::string>& args) {
   if (model) record = handler->createKextModelFromProtobufModel(model.get());
   std::optional<SHA1Digest> recordHash;
   if (record) recordHash = sha1(record.get(), sizeof(KextBatteryModel));
-  line("record SHA-1", recordHash ? hex(recordHash->data(), recordHash->size())
+  line("record SHA-1", recordHash ? hexString(recordHash->data(), recordHash->size())
                        : model    ? "(refused by the record builder)"
                                   : "-");
 
   const std::optional<Data> published = publishedHash(*handler);
-  line("driver's hash", published ? hex(published->data(), published->size()) : "(none published)");
+  line("driver's hash",
+       published ? hexString(published->data(), published->size()) : "(none published)");
 
   const char* verdict = "loaded";
   if (!recordHash)

@@ -197,16 +197,6 @@ bool writeOutput(const std::string& command, const std::string& path, std::strin
   return true;
 }
 
-std::string hex(const uint8_t* bytes, size_t size) {
-  static const char kHex[] = "0123456789abcdef";
-  std::string out;
-  for (size_t i = 0; i < size; ++i) {
-    out += kHex[bytes[i] >> 4];
-    out += kHex[bytes[i] & 15];
-  }
-  return out;
-}
-
 void routeLogToStderr(const std::string& command) {
   setLogSink(std::make_shared<StderrSink>("rcmodel " + command));
   setLogLevelSpec("error");

@@ -62,9 +62,6 @@ void routeLogToStderr(const std::string& command);
 std::shared_ptr<OTAParamRC> readFirstModel(const std::string& command, const std::string& path,
                                            size_t* count = nullptr);
 
-// Lower-case hexadecimal.
-std::string hex(const uint8_t* bytes, size_t size);
-
 // The commands; each takes the arguments after its name and returns the exit
 // code.
 int runDecode(const std::vector<std::string>& args);

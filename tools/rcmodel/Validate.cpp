@@ -79,7 +79,7 @@ bool validate(const std::string& path) {
   }
   const SHA1Digest digest = sha1(record.get(), sizeof(KextBatteryModel));
   std::printf("  ok: the daemon would load it; record SHA-1 %s\n",
-              hex(digest.data(), digest.size()).c_str());
+              hexString(digest.data(), digest.size()).c_str());
   return true;
 }
 
