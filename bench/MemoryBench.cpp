@@ -22,8 +22,7 @@
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "platform/Backend.h"
-
-extern char** environ;
+#include "tests/support/DaemonEnvironment.h"
 
 namespace kolvrand::bench {
 
@@ -59,18 +58,7 @@ DaemonRun runDaemon(const fs::path& device) {
   int pipeFds[2];
   if (pipe2(pipeFds, O_CLOEXEC) != 0) fail("pipe2 failed");
 
-  std::vector<std::string> env;
-  for (char** e = environ; *e; ++e) {
-    std::string_view v(*e);
-    if (!v.starts_with("KOLVRAND_") && !v.starts_with("JOURNAL_STREAM=") &&
-        !v.starts_with("STATE_DIRECTORY="))
-      env.emplace_back(v);
-  }
-  env.push_back("KOLVRAND_DEVICE=" + device.string());
-  std::vector<char*> envp;
-  for (auto& s : env) envp.push_back(s.data());
-  envp.push_back(nullptr);
-
+  const test::DaemonEnvironment env(device, std::nullopt);
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
   posix_spawn_file_actions_adddup2(&actions, pipeFds[1], STDERR_FILENO);
@@ -78,7 +66,7 @@ DaemonRun runDaemon(const fs::path& device) {
   char* argv[] = {binary.data(), nullptr};
   pid_t pid = -1;
   const auto start = Clock::now();
-  const int spawned = posix_spawn(&pid, binary.c_str(), &actions, nullptr, argv, envp.data());
+  const int spawned = posix_spawn(&pid, binary.c_str(), &actions, nullptr, argv, env.envp());
   posix_spawn_file_actions_destroy(&actions);
   ::close(pipeFds[1]);
   if (spawned != 0) fail("cannot start " + binary);

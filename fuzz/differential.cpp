@@ -3,9 +3,6 @@
 // fields dropped, each field once), written both unpacked and packed; our
 // reader must decode both to exactly the values libprotobuf holds, our writer
 // must reproduce libprotobuf's bytes, and libprotobuf must read ours back.
-#include <google/protobuf/descriptor.h>
-#include <google/protobuf/message.h>
-
 #include <bit>
 #include <cstddef>
 #include <cstdint>
@@ -16,51 +13,12 @@
 #include "model/OTAParamRC.h"
 #include "oracle_packed.pb.h"
 #include "oracle_plain.pb.h"
+#include "tests/support/OracleDictionary.h"
 
 using namespace kolvrand;
 using fuzz::check;
-using google::protobuf::FieldDescriptor;
-using google::protobuf::Message;
 
 namespace {
-
-// The dictionary form of a libprotobuf message by the rules of ours: lists
-// always, chemID always (it has no presence in ours), every other field when set.
-Value dictionaryOf(const Message& m) {
-  const auto* reflection = m.GetReflection();
-  const auto* descriptor = m.GetDescriptor();
-  Dictionary d;
-  for (int i = 0; i < descriptor->field_count(); ++i) {
-    const FieldDescriptor* f = descriptor->field(i);
-    if (f->is_repeated()) {
-      check(f->cpp_type() == FieldDescriptor::CPPTYPE_FLOAT);
-      Array a;
-      for (int k = 0; k < reflection->FieldSize(m, f); ++k)
-        a.emplace_back(Number::fromFloat(reflection->GetRepeatedFloat(m, f, k)));
-      d.set(f->name(), std::move(a));
-      continue;
-    }
-    if (f->cpp_type() == FieldDescriptor::CPPTYPE_UINT32) {
-      d.set(f->name(), Number::fromUnsigned(reflection->GetUInt32(m, f)));
-      continue;
-    }
-    if (!reflection->HasField(m, f)) continue;
-    switch (f->cpp_type()) {
-      case FieldDescriptor::CPPTYPE_MESSAGE:
-        d.set(f->name(), dictionaryOf(reflection->GetMessage(m, f)));
-        break;
-      case FieldDescriptor::CPPTYPE_FLOAT:
-        d.set(f->name(), Number::fromFloat(reflection->GetFloat(m, f)));
-        break;
-      case FieldDescriptor::CPPTYPE_ENUM:
-        d.set(f->name(), OTAParamRC::mLBConfigAsString(reflection->GetEnumValue(m, f)));
-        break;
-      default:
-        check(false);  // a field type the schema does not use
-    }
-  }
-  return d;
-}
 
 std::vector<uint8_t> bytesOf(const std::string& s) {
   return {s.begin(), s.end()};
@@ -83,7 +41,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   // Our writer always writes chemID; with it set, the bytes can match.
   if (!plain.has_chemid()) plain.set_chemid(0);
   const std::string canonical = plain.SerializeAsString();
-  const Value expected = dictionaryOf(plain);
+  const Value expected = test::oracleDictionary(plain);
   decodeAndCompare(canonical, expected);
 
   kolvrand::oracle_packed::OTAParamRC packed;
@@ -97,6 +55,6 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   check(written == bytesOf(canonical));
   kolvrand::oracle::OTAParamRC parsed;
   check(parsed.ParseFromArray(written.data(), static_cast<int>(written.size())));
-  check(dictionaryOf(parsed) == expected);
+  check(test::oracleDictionary(parsed) == expected);
   return 0;
 }

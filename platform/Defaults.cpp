@@ -227,26 +227,10 @@ std::optional<std::string> NSUserDefaults::stringForKey(std::string_view key) co
   return v->get<std::string>();
 }
 
-int64_t NSUserDefaults::integerForKey(std::string_view key) const {
-  JSON content = load(*suite_);
-  const JSON* v = find(content, key);
-  if (!v || !v->is_number_integer()) return 0;
-  if (v->is_number_unsigned()) {
-    uint64_t u = v->get<uint64_t>();
-    return u > static_cast<uint64_t>(INT64_MAX) ? 0 : static_cast<int64_t>(u);
-  }
-  return v->get<int64_t>();
-}
-
 bool NSUserDefaults::boolForKey(std::string_view key) const {
   JSON content = load(*suite_);
   const JSON* v = find(content, key);
   return v && v->is_boolean() && v->get<bool>();
-}
-
-bool NSUserDefaults::objectForKeyExists(std::string_view key) const {
-  JSON content = load(*suite_);
-  return find(content, key) != nullptr;
 }
 
 bool NSUserDefaults::setObject(std::string_view value, std::string_view key) {
@@ -259,10 +243,6 @@ bool NSUserDefaults::setInteger(int64_t value, std::string_view key) {
 
 bool NSUserDefaults::setBool(bool value, std::string_view key) {
   return update(*suite_, key, [&](JSON& c) { c[std::string(key)] = value; });
-}
-
-bool NSUserDefaults::removeObjectForKey(std::string_view key) {
-  return update(*suite_, key, [&](JSON& c) { c.erase(std::string(key)); });
 }
 
 const std::filesystem::path& NSUserDefaults::path() const {

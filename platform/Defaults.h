@@ -33,16 +33,13 @@ class NSUserDefaults {
 
   // An absent key, or a value of another type, reads as nil, 0 or false.
   std::optional<std::string> stringForKey(std::string_view key) const;
-  int64_t integerForKey(std::string_view key) const;
   bool boolForKey(std::string_view key) const;
-  bool objectForKeyExists(std::string_view key) const;
 
   // Each returns false (after logging) when the value could not be made
   // durable; the file then keeps its previous content.
   bool setObject(std::string_view value, std::string_view key);
   bool setInteger(int64_t value, std::string_view key);
   bool setBool(bool value, std::string_view key);
-  bool removeObjectForKey(std::string_view key);
 
   const std::filesystem::path& path() const;
 

@@ -153,16 +153,6 @@ void Dictionary::set(std::string key, Value value) {
   entries_.emplace_back(std::move(key), std::move(value));
 }
 
-bool Dictionary::erase(std::string_view key) {
-  for (auto it = entries_.begin(); it != entries_.end(); ++it) {
-    if (it->first == key) {
-      entries_.erase(it);
-      return true;
-    }
-  }
-  return false;
-}
-
 bool Dictionary::operator==(const Dictionary& other) const {
   if (size() != other.size()) return false;
   for (const auto& [k, v] : entries_) {

@@ -76,7 +76,6 @@ class Dictionary {
   const Value* find(std::string_view key) const;
   Value* find(std::string_view key);
   void set(std::string key, Value value);
-  bool erase(std::string_view key);
 
   // Defined below Value, which the entries need complete.
   size_t size() const;

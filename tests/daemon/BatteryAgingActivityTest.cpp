@@ -71,13 +71,5 @@ TEST(BatteryAgingActivity, NilAgentOnlyLogsTheState) {
   EXPECT_EQ(device.logLines(), Lines{kTrigger});
 }
 
-TEST(ConditionCheckingAgent, ExecutionConditionCheckLogsOnItsOwnLog) {
-  test::TestDevice device;
-  EXPECT_TRUE(ConditionCheckingAgent::init()->performExecutionConditionChecking());
-  EXPECT_EQ(device.logLines(),
-            Lines{"debug [batteryAgingUpdate] -[ConditionCheckingAgent "
-                  "performExecutionConditionChecking] Checking execution requirements"});
-}
-
 }  // namespace
 }  // namespace kolvrand

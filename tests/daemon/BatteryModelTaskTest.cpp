@@ -2,8 +2,6 @@
 // and what it stores.
 #include <gtest/gtest.h>
 
-#include <fstream>
-
 #include "daemon/BatteryModelTask.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "tests/support/TestDevice.h"
@@ -19,34 +17,8 @@ const std::string kNoModel =
     "error [batteryModelDataHandling] -[BatteryModelDataHandler getBatteryModelFileURLString:] "
     "<Error> file not present: ";
 
-void writeState(const TestDevice& device, const nlohmann::json& state) {
-  std::filesystem::create_directories(device.statePath().parent_path());
-  std::ofstream(device.statePath()) << state.dump();
-}
-
 void runTask(BatteryModelDataHandler* handler) {
   runBatteryModelTask(os_log_create(DaemonIdentifier, "main"), handler);
-}
-
-TEST(BatteryModelTask, SameBootSessionSkipsWithoutAskingForTheChemID) {
-  TestDevice device;
-  writeState(device, {{"savedBootUUID", kUUID}});
-  runTask(BatteryModelDataHandler::init().get());
-  EXPECT_EQ(device.logLines(),
-            Lines{"default [main] Main Unchanged boot UUID. Skipping battery model task"});
-  EXPECT_EQ(device.state(), (nlohmann::json{{"savedBootUUID", kUUID}}));
-}
-
-TEST(BatteryModelTask, FailedUploadKeepsThePreviousSession) {
-  TestDevice device;
-  writeState(device, {{"savedBootUUID", "previous-session"}});
-  runTask(BatteryModelDataHandler::init().get());
-  Lines lines = device.logLines();
-  ASSERT_GE(lines.size(), 3u);
-  EXPECT_EQ(lines.front(), "debug [main] Battery data upload run for chemId 0x2168");
-  EXPECT_EQ(lines.back(), "error [main] Battery data upload failed");
-  EXPECT_EQ(device.state()["savedBootUUID"], "previous-session");
-  EXPECT_EQ(device.state()["savedChemID"], 8552);
 }
 
 TEST(BatteryModelTask, NilHandlerReadsChemIDZeroAndFails) {

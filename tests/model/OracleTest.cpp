@@ -5,8 +5,6 @@
 #include <google/protobuf/message.h>
 #include <gtest/gtest.h>
 
-#include <cstdio>
-#include <fstream>
 #include <random>
 #include <string>
 
@@ -14,6 +12,7 @@
 #include "oracle_packed.pb.h"
 #include "oracle_plain.pb.h"
 #include "tests/model/Support.h"
+#include "tests/support/OracleDictionary.h"
 
 namespace kolvrand {
 namespace {
@@ -58,36 +57,6 @@ void fillRandom(Message& m, std::mt19937& rng) {
   }
 }
 
-// The dictionary form of a libprotobuf message, by the rules our messages use.
-Value dictionaryOf(const Message& m) {
-  const auto* reflection = m.GetReflection();
-  const auto* descriptor = m.GetDescriptor();
-  Dictionary d;
-  for (int i = 0; i < descriptor->field_count(); ++i) {
-    const FieldDescriptor* f = descriptor->field(i);
-    if (f->is_repeated()) {
-      Array a;
-      for (int k = 0; k < reflection->FieldSize(m, f); ++k)
-        a.emplace_back(Number::fromFloat(reflection->GetRepeatedFloat(m, f, k)));
-      d.set(f->name(), std::move(a));
-    } else if (f->cpp_type() == FieldDescriptor::CPPTYPE_UINT32) {
-      d.set(f->name(), Number::fromUnsigned(reflection->GetUInt32(m, f)));
-    } else if (reflection->HasField(m, f)) {
-      switch (f->cpp_type()) {
-        case FieldDescriptor::CPPTYPE_MESSAGE:
-          d.set(f->name(), dictionaryOf(reflection->GetMessage(m, f)));
-          break;
-        case FieldDescriptor::CPPTYPE_FLOAT:
-          d.set(f->name(), Number::fromFloat(reflection->GetFloat(m, f)));
-          break;
-        default:
-          d.set(f->name(), OTAParamRC::mLBConfigAsString(reflection->GetEnumValue(m, f)));
-      }
-    }
-  }
-  return d;
-}
-
 TEST(OTAParamRCOracle, AgreesWithLibprotobufOnRandomModels) {
   std::mt19937 rng(20240601);
   for (int i = 0; i < 1200; ++i) {
@@ -104,14 +73,14 @@ TEST(OTAParamRCOracle, AgreesWithLibprotobufOnRandomModels) {
 
     OTAParamRC ours;
     ASSERT_TRUE(test::decode(ours, std::vector<uint8_t>(input.begin(), input.end())));
-    const Value expected = dictionaryOf(plain);
+    const Value expected = test::oracleDictionary(plain);
     ASSERT_EQ(ours.dictionaryRepresentation(), expected);
 
     const std::vector<uint8_t> written = ours.data();
     ASSERT_EQ(std::string(written.begin(), written.end()), plainBytes);
     kolvrand::oracle::OTAParamRC parsed;
     ASSERT_TRUE(parsed.ParseFromArray(written.data(), static_cast<int>(written.size())));
-    ASSERT_EQ(dictionaryOf(parsed), expected);
+    ASSERT_EQ(test::oracleDictionary(parsed), expected);
 
     auto copy = ours.copy();
     EXPECT_EQ(copy->hash(), ours.hash());
@@ -121,35 +90,6 @@ TEST(OTAParamRCOracle, AgreesWithLibprotobufOnRandomModels) {
       EXPECT_TRUE(copy->isEqual(&ours));
     }
   }
-}
-
-TEST(OTAParamRCOracle, ProtocDecodesOurBytesWithTheSchema) {
-  OTAParamRC m;
-  m.setChemID(0x1234);
-  m.setMLBConfig(kKVRNorthSouthSplitMLB);
-  auto r0 = std::make_shared<OTAResistanceData>();
-  r0->addResistance25C(1.5f);
-  m.setR0(r0);
-  m.addGridOCV(3.25f);
-  const std::string path = std::string(KOLVRAND_BINARY_DIR) + "/oracle_model.bin";
-  {
-    const std::vector<uint8_t> bytes = m.data();
-    std::ofstream(path, std::ios::binary)
-        .write(reinterpret_cast<const char*>(bytes.data()),
-               static_cast<std::streamsize>(bytes.size()));
-  }
-  const std::string command = std::string(KOLVRAND_PROTOC) + " --decode=kolvrand.OTAParamRC -I " +
-                              KOLVRAND_SOURCE_DIR + "/model " + KOLVRAND_SOURCE_DIR +
-                              "/model/battery_model.proto < " + path;
-  FILE* pipe = popen(command.c_str(), "r");
-  ASSERT_NE(pipe, nullptr);
-  std::string text;
-  char buffer[256];
-  while (size_t n = fread(buffer, 1, sizeof buffer, pipe)) text.append(buffer, n);
-  ASSERT_EQ(pclose(pipe), 0) << text;
-  EXPECT_EQ(text,
-            "R0 {\n  resistance25C: 1.5\n}\nchemID: 4660\ngridOCV: 3.25\n"
-            "MLBConfig: kKVRNorthSouthSplitMLB\n");
 }
 
 }  // namespace

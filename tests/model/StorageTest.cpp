@@ -122,18 +122,6 @@ TEST(DecodedLists, ReadingAgainIntoTheSameMessageKeepsBothDecodes) {
   EXPECT_EQ(list(m.r0()->temperatureCoeffs(), 2), (std::vector<float>{4, 5}));
 }
 
-TEST(DecodedLists, PackedAndUnpackedRunsOfOneFieldAccumulate) {
-  // Field 19 packed (two floats), then unpacked twice, then packed again:
-  // the first run is lent room, the later ones grow the list.
-  const std::vector<uint8_t> bytes = test::fromHex(
-      "9A 01 08 00 00 80 3F 00 00 00 40"
-      "9D 01 00 00 40 40 9D 01 00 00 80 40"
-      "9A 01 04 00 00 A0 40");
-  OTAParamRC m;
-  ASSERT_TRUE(decode(m, bytes));
-  EXPECT_EQ(list(m.gridOCVs(), m.gridOCVsCount()), (std::vector<float>{1, 2, 3, 4, 5}));
-}
-
 // Unpacked runs are read many entries at a time: every run length, with one-
 // and two-byte tags, cut at every byte, must give what reading the entries
 // one by one gives: each whole entry, then 0.0 and failure for an entry whose

@@ -46,10 +46,7 @@ std::string recordBytes(const OTAParamRC& model) {
 }
 
 std::string hex(const std::string& bytes) {
-  static const char* digits = "0123456789abcdef";
-  std::string out;
-  for (unsigned char c : bytes) out += {digits[c >> 4], digits[c & 15]};
-  return out;
+  return hexString(reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size());
 }
 
 std::string fileContents(const fs::path& path) {

@@ -268,45 +268,13 @@ TEST(HostBackend, BootSessionIsTheKernelBootId) {
   platform::setBackend(nullptr);
 }
 
-TEST(ValueJSON, RoundTripsAndRejectsWhatHasNoValue) {
-  const char* text =
-      R"({"b": [1, -2, 18446744073709551615, 0.25, "s", true, {"$data": "00ff"}], "a": {}})";
-  std::string error;
-  auto v = platform::parseValueJSON(text, &error);
-  ASSERT_TRUE(v) << error;
-  EXPECT_EQ(v->asDictionary()->begin()->first, "b");
-
-  for (const char* bad :
-       {"null", R"({"a": [null]})", R"({"$data": "0"})", R"({"$data": 1})", "{"}) {
-    error.clear();
-    EXPECT_FALSE(platform::parseValueJSON(bad, &error)) << bad;
-    EXPECT_FALSE(error.empty()) << bad;
-  }
-}
-
 TEST(SHA1, MatchesTheStandardVectors) {
-  struct Case {
-    std::string input;
-    const char* digest;
-  };
-  const Case cases[] = {
-      {"", "da39a3ee5e6b4b0d3255bfef95601890afd80709"},
+  const std::pair<std::string, const char*> cases[] = {
       {"abc", "a9993e364706816aba3e25717850c26c9cd0d89d"},
-      {"abcdbcdecdefdefgefghfghighijhijkijkljklmklmnlmnomnopnopq",
-       "84983e441c3bd26ebaae4aa1f95129e5e54670f1"},
-      {std::string(1000000, 'a'), "34aa973cd4c4daa4f61eeb2bdbad27316534016f"},
-  };
-  for (const auto& c : cases) {
-    SHA1Digest oneShot = sha1(c.input.data(), c.input.size());
-    EXPECT_EQ(hexString(oneShot.data(), oneShot.size()), c.digest);
-    // The same digest when fed in uneven pieces.
-    CC_SHA1_CTX ctx;
-    ASSERT_EQ(CC_SHA1_Init(&ctx), 1);
-    for (size_t at = 0, step = 1; at < c.input.size(); at += step, step = step * 3 + 1)
-      ASSERT_EQ(CC_SHA1_Update(&ctx, c.input.data() + at, std::min(step, c.input.size() - at)), 1);
-    uint8_t md[CC_SHA1_DIGEST_LENGTH];
-    ASSERT_EQ(CC_SHA1_Final(md, &ctx), 1);
-    EXPECT_EQ(hexString(md, sizeof md), c.digest);
+      {std::string(1000000, 'a'), "34aa973cd4c4daa4f61eeb2bdbad27316534016f"}};
+  for (const auto& [input, digest] : cases) {
+    SHA1Digest oneShot = sha1(input.data(), input.size());
+    EXPECT_EQ(hexString(oneShot.data(), oneShot.size()), digest);
   }
 }
 

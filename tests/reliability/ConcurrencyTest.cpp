@@ -46,7 +46,7 @@ TEST(Concurrency, ActivityHandlerBesideTheBatteryModelTask) {
 
   for (int round = 0; round < kRounds; ++round) {
     // A new boot session each round, so every task uploads and writes.
-    ASSERT_TRUE(defaults->removeObjectForKey("savedBootUUID"));
+    ASSERT_TRUE(defaults->setObject("", "savedBootUUID"));
     std::thread task([&] { runBatteryModelTask(mainLog, handler.get()); });
     std::thread activity([&] {
       for (int i = 0; i < kRunsPerRound; ++i) {
@@ -112,7 +112,8 @@ TEST(Concurrency, WritersOfOneSuiteLoseNothing) {
     auto d = NSUserDefaults::initWithSuiteName(suite, dir);
     if (!d) return false;
     for (int n = 1; n <= kWrites; ++n) {
-      if (!d->setInteger(n, key) || d->integerForKey(key) != n) return false;
+      const std::string value = std::to_string(n);
+      if (!d->setObject(value, key) || d->stringForKey(key) != value) return false;
     }
     return true;
   };
@@ -139,9 +140,9 @@ TEST(Concurrency, WritersOfOneSuiteLoseNothing) {
 
   auto d = NSUserDefaults::initWithSuiteName(suite, dir);
   for (int p = 0; p < kProcesses; ++p)
-    EXPECT_EQ(d->integerForKey("process" + std::to_string(p)), kWrites);
+    EXPECT_EQ(d->stringForKey("process" + std::to_string(p)), std::to_string(kWrites));
   for (int t = 0; t < kThreads; ++t)
-    EXPECT_EQ(d->integerForKey("thread" + std::to_string(t)), kWrites);
+    EXPECT_EQ(d->stringForKey("thread" + std::to_string(t)), std::to_string(kWrites));
   fs::remove_all(dir);
 }
 

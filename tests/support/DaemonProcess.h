@@ -16,7 +16,7 @@
 #include <thread>
 #include <vector>
 
-extern char** environ;
+#include "tests/support/DaemonEnvironment.h"
 
 namespace kolvrand::test {
 
@@ -31,19 +31,7 @@ class DaemonProcess {
   DaemonProcess(const std::filesystem::path& device, const std::string& logLevel = "debug",
                 std::vector<std::string> launcher = {})
       : stderrPath_(device / "daemon.stderr") {
-    std::vector<std::string> env;
-    for (char** e = environ; *e; ++e) {
-      std::string_view v(*e);
-      if (!v.starts_with("KOLVRAND_") && !v.starts_with("JOURNAL_STREAM=") &&
-          !v.starts_with("STATE_DIRECTORY="))
-        env.emplace_back(v);
-    }
-    env.push_back("KOLVRAND_DEVICE=" + device.string());
-    env.push_back("KOLVRAND_LOG_LEVEL=" + logLevel);
-    std::vector<char*> envp;
-    for (auto& s : env) envp.push_back(s.data());
-    envp.push_back(nullptr);
-
+    const DaemonEnvironment env(device, logLevel);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_addopen(&actions, 2, stderrPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
@@ -52,7 +40,7 @@ class DaemonProcess {
     std::vector<char*> argv;
     for (auto& s : launcher) argv.push_back(s.data());
     argv.push_back(nullptr);
-    running_ = posix_spawn(&pid_, argv[0], &actions, nullptr, argv.data(), envp.data()) == 0;
+    running_ = posix_spawn(&pid_, argv[0], &actions, nullptr, argv.data(), env.envp()) == 0;
     posix_spawn_file_actions_destroy(&actions);
   }
   ~DaemonProcess() {
