@@ -192,21 +192,6 @@ TEST(KextBatteryModel, AbsentOptionalPartsGiveTheirDefaults) {
   EXPECT_EQ(std::memcmp(reinterpret_cast<const uint8_t*>(record.get()) + 13876, zeros, 20), 0);
 }
 
-TEST(KextBatteryModel, EqualModelsGiveIdenticalRecordsAndDigests) {
-  test::TestDevice device;
-  auto handler = BatteryModelDataHandler::init();
-  for (uint32_t chemID : {0x1532u, 0x1608u, 0x2168u}) {
-    auto a = makeExampleModel(chemID);
-    auto b = a->copy();
-    ASSERT_TRUE(a->isEqual(b.get()));
-    auto ra = handler->createKextModelFromProtobufModel(a.get());
-    auto rb = handler->createKextModelFromProtobufModel(b.get());
-    ASSERT_TRUE(ra && rb);
-    EXPECT_EQ(std::memcmp(ra.get(), rb.get(), kKextBatteryModelSize), 0);
-    EXPECT_EQ(sha1(ra.get(), kKextBatteryModelSize), sha1(rb.get(), kKextBatteryModelSize));
-  }
-}
-
 TEST(KextBatteryModel, NullOrShortModelsAreRefusedWithTheirReasons) {
   const std::string prefix =
       "error [batteryModelDataHandling] -[BatteryModelDataHandler "

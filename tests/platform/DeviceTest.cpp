@@ -236,28 +236,6 @@ TEST_F(SimulatedDriver, PublishesAKVRVectorFromDeviceJsonAsGiven) {
   EXPECT_TRUE(std::filesystem::exists(kept()));
 }
 
-TEST_F(SimulatedDevice, DirectoriesLiveInTheDevice) {
-  makeDevice(kDevice);
-  std::string error;
-  auto lib = NSFileManager::defaultManager().URLForDirectory(NSLibraryDirectory, NSSystemDomainMask,
-                                                             nullptr, false, &error);
-  ASSERT_TRUE(lib);
-  EXPECT_EQ(*lib, std::filesystem::absolute(dir.path()) / "Library");
-  EXPECT_FALSE(std::filesystem::exists(*lib));  // never created by the lookup
-
-  auto& fm = NSFileManager::defaultManager();
-  test::writeFile(*lib / "KVR" / "BatteryModels" / "D1" / "2168.rcmodel", "x");
-  EXPECT_TRUE(fm.fileExistsAtPath((*lib / "KVR").string()));
-  EXPECT_TRUE(fm.fileExistsAtPath((*lib / "KVR/BatteryModels/D1/2168.rcmodel").string()));
-  EXPECT_FALSE(fm.fileExistsAtPath((*lib / "KVR/BatteryModels/D1/2168a.rcmodel").string()));
-  EXPECT_FALSE(fm.fileExistsAtPath(""));
-
-  auto d = NSUserDefaults::initWithSuiteName("com.tesvar.kolvrand");
-  ASSERT_TRUE(d);
-  EXPECT_EQ(d->path(),
-            std::filesystem::absolute(dir.path()) / "state" / "com.tesvar.kolvrand.json");
-}
-
 TEST(HostBackend, BootSessionIsTheKernelBootId) {
   platform::setBackend(platform::makeHostBackend());
   std::string bootId = test::readFileText("/proc/sys/kernel/random/boot_id");
