@@ -51,12 +51,7 @@ void PBRepeatedFloat::append(const PBRepeatedFloat& other) {
 
 void PBRepeatedFloat::appendLittleEndian(const uint8_t* bytes, size_t count) {
   if (count == 0) return;
-  float* out = appendUninitialized(count);
-  if constexpr (std::endian::native == std::endian::little) {
-    std::memcpy(out, bytes, count * sizeof(float));
-  } else {
-    for (size_t i = 0; i < count; ++i) out[i] = wire::loadFloat(bytes + 4 * i);
-  }
+  wire::loadFloats(appendUninitialized(count), bytes, count);
 }
 
 bool PBRepeatedFloatIsEqual(const PBRepeatedFloat& a, const PBRepeatedFloat& b) {

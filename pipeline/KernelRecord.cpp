@@ -1,10 +1,10 @@
 // Building the kernel record from a decoded model: straight copies of the
 // first elements of every list. A model that cannot fill the record is refused
 // rather than padded, so no byte of the record is made up.
-#include <cstring>
 #include <new>
 
 #include "model/OTAParamRC.h"
+#include "model/Wire.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/KextBatteryModel.h"
 #include "pipeline/KextBatteryModelSources.h"
@@ -47,8 +47,10 @@ bool modelFillsRecord(const OTAParamRC& model, const os_log_t& log) {
   return fills;
 }
 
+// The record is little-endian on every host; modelFillsRecord has checked that
+// the list holds `count` elements.
 void copyFloats(uint8_t* destination, std::span<const float> source, size_t count) {
-  std::memcpy(destination, source.data(), count * sizeof(float));
+  wire::storeFloats(destination, source.data(), count);
 }
 
 }  // namespace

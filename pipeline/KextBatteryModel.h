@@ -9,24 +9,49 @@
 
 namespace kolvrand {
 
-static_assert(std::endian::native == std::endian::little,
-              "the driver reads the record in little-endian order");
+// A 32-bit value held as its four little-endian bytes, whatever the host's
+// byte order: the driver reads the record little-endian, so a record built on
+// a big-endian host is still the same bytes. Byte-aligned, so the record has
+// no padding and no field access is unaligned on any target.
+template <typename T>
+class LittleEndian32 {
+  static_assert(sizeof(T) == 4);
+
+ public:
+  LittleEndian32() = default;  // not zeroed: the builder writes every byte
+  LittleEndian32(T value) { *this = value; }
+  LittleEndian32& operator=(T value) {
+    const auto bits = std::bit_cast<uint32_t>(value);
+    for (size_t i = 0; i < 4; ++i) bytes_[i] = static_cast<uint8_t>(bits >> (8 * i));
+    return *this;
+  }
+  operator T() const {
+    uint32_t bits = 0;
+    for (size_t i = 0; i < 4; ++i) bits |= uint32_t{bytes_[i]} << (8 * i);
+    return std::bit_cast<T>(bits);
+  }
+
+ private:
+  uint8_t bytes_[4];
+};
+
+using LEFloat = LittleEndian32<float>;
 
 // The image of one resistance table.
 struct KextResistanceTable {
   static constexpr size_t kResistance25CCount = 51;
   static constexpr size_t kTemperatureCoeffCount = 153;
-  float resistance25C[kResistance25CCount];
-  float temperatureCoeff[kTemperatureCoeffCount];
+  LEFloat resistance25C[kResistance25CCount];
+  LEFloat temperatureCoeff[kTemperatureCoeffCount];
 };
 
 // The image of the board-path resistances, in field-number order.
 struct KextBMUResistance {
-  float traceResistance25C;
-  float traceResistanceTemperatureCoeff;
-  float systemEquivalentResistance;
-  float downstreamCommonResistance;
-  float downstreamNorthResistance;
+  LEFloat traceResistance25C;
+  LEFloat traceResistanceTemperatureCoeff;
+  LEFloat systemEquivalentResistance;
+  LEFloat downstreamCommonResistance;
+  LEFloat downstreamNorthResistance;
 };
 
 struct KextBatteryModel {
@@ -36,44 +61,45 @@ struct KextBatteryModel {
   static constexpr size_t kGridOCVCount = 303;
   static constexpr size_t kSlopeCount = 51;
 
-  uint32_t chemID;
+  LittleEndian32<uint32_t> chemID;
   KextResistanceTable r0, r1, r2, r3;
   KextResistanceTable rCFreq1, rCFreq2, rCFreq3, rCFreq4;
   KextResistanceTable baselineR0, baselineR1, baselineR2, baselineR3, baselineR4;
   KextResistanceTable baselineRCFreq1, baselineRCFreq2, baselineRCFreq3, baselineRCFreq4;
   KextBMUResistance bmuResistance;
-  float agingCoeffForR0[kAgingCoeffCount];
-  float agingCoeffForR1[kAgingCoeffCount];
-  float agingCoeffForR2[kAgingCoeffCount];
-  float agingCoeffForR3[kAgingCoeffCount];
-  float agingCoeffForR0TemperatureCoeff[kAgingTemperatureCoeffCount];
-  float agingCoeffForR1TemperatureCoeff[kAgingTemperatureCoeffCount];
-  float agingCoeffForR2TemperatureCoeff[kAgingTemperatureCoeffCount];
-  float agingCoeffForR3TemperatureCoeff[kAgingTemperatureCoeffCount];
-  float agingCoeffForRCFreq1[kAgingCoeffCount];
-  float agingCoeffForRCFreq2[kAgingCoeffCount];
-  float agingCoeffForRCFreq3[kAgingCoeffCount];
-  float agingCoeffForRCFreq4[kAgingCoeffCount];
-  float agingCoeffForRCFreq1TemperatureCoeff[kAgingTemperatureCoeffCount];
-  float agingCoeffForRCFreq2TemperatureCoeff[kAgingTemperatureCoeffCount];
-  float agingCoeffForRCFreq3TemperatureCoeff[kAgingTemperatureCoeffCount];
-  float agingCoeffForRCFreq4TemperatureCoeff[kAgingTemperatureCoeffCount];
-  float baselineRdc[kBaselineRdcCount];
-  float baselineWRdc;
-  float gridOCV[kGridOCVCount];
-  float slopeForR0Extrap[kSlopeCount];
-  float slopeForR1Extrap[kSlopeCount];
-  float slopeForR2Extrap[kSlopeCount];
-  float slopeForR3Extrap[kSlopeCount];
-  float maxRdcRatio;
-  float maxRdcRatioR2Extrap;
-  int32_t mLBConfig;
+  LEFloat agingCoeffForR0[kAgingCoeffCount];
+  LEFloat agingCoeffForR1[kAgingCoeffCount];
+  LEFloat agingCoeffForR2[kAgingCoeffCount];
+  LEFloat agingCoeffForR3[kAgingCoeffCount];
+  LEFloat agingCoeffForR0TemperatureCoeff[kAgingTemperatureCoeffCount];
+  LEFloat agingCoeffForR1TemperatureCoeff[kAgingTemperatureCoeffCount];
+  LEFloat agingCoeffForR2TemperatureCoeff[kAgingTemperatureCoeffCount];
+  LEFloat agingCoeffForR3TemperatureCoeff[kAgingTemperatureCoeffCount];
+  LEFloat agingCoeffForRCFreq1[kAgingCoeffCount];
+  LEFloat agingCoeffForRCFreq2[kAgingCoeffCount];
+  LEFloat agingCoeffForRCFreq3[kAgingCoeffCount];
+  LEFloat agingCoeffForRCFreq4[kAgingCoeffCount];
+  LEFloat agingCoeffForRCFreq1TemperatureCoeff[kAgingTemperatureCoeffCount];
+  LEFloat agingCoeffForRCFreq2TemperatureCoeff[kAgingTemperatureCoeffCount];
+  LEFloat agingCoeffForRCFreq3TemperatureCoeff[kAgingTemperatureCoeffCount];
+  LEFloat agingCoeffForRCFreq4TemperatureCoeff[kAgingTemperatureCoeffCount];
+  LEFloat baselineRdc[kBaselineRdcCount];
+  LEFloat baselineWRdc;
+  LEFloat gridOCV[kGridOCVCount];
+  LEFloat slopeForR0Extrap[kSlopeCount];
+  LEFloat slopeForR1Extrap[kSlopeCount];
+  LEFloat slopeForR2Extrap[kSlopeCount];
+  LEFloat slopeForR3Extrap[kSlopeCount];
+  LEFloat maxRdcRatio;
+  LEFloat maxRdcRatioR2Extrap;
+  LittleEndian32<int32_t> mLBConfig;
 };
 
 inline constexpr size_t kKextBatteryModelSize = 29056;
 
 static_assert(sizeof(KextResistanceTable) == 816);
 static_assert(sizeof(KextBMUResistance) == 20);
+static_assert(alignof(KextBatteryModel) == 1);
 static_assert(sizeof(KextBatteryModel) == kKextBatteryModelSize);
 static_assert(offsetof(KextBatteryModel, r0) == 0x0004);
 static_assert(offsetof(KextBatteryModel, r1) == 0x0334);

@@ -10,7 +10,7 @@ namespace {
 #define KEXT_LIST(list, recordField)                                                                 \
   KextListSource {                                                                                   \
 #list, offsetof(KextBatteryModel, recordField),                                                  \
-        sizeof(KextBatteryModel::recordField) / sizeof(float),                                       \
+        sizeof(KextBatteryModel::recordField) / sizeof(LEFloat),                                     \
         [](const OTAParamRC&                                                                         \
                m) { return std::span<const float>(m.list(), static_cast<size_t>(m.list##Count())); } \
   }

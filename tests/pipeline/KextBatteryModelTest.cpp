@@ -144,9 +144,10 @@ std::shared_ptr<OTAParamRC> markedModel(const std::vector<Slot>& slots, size_t e
   return m;
 }
 
+// The little-endian value at `offset`, on any host.
 template <typename T>
 T at(const KextBatteryModel& record, size_t offset) {
-  T v;
+  LittleEndian32<T> v;
   std::memcpy(&v, reinterpret_cast<const uint8_t*>(&record) + offset, sizeof v);
   return v;
 }

@@ -37,6 +37,9 @@ class DaemonProcess {
     posix_spawn_file_actions_addopen(&actions, 2, stderrPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
                                      0644);
     launcher.push_back(daemonBinary().string());
+    // A previous run's stderr must not be read as this one's: posix_spawn may
+    // return before the child has opened the file (it does under qemu-user).
+    std::filesystem::remove(stderrPath_);
     std::vector<char*> argv;
     for (auto& s : launcher) argv.push_back(s.data());
     argv.push_back(nullptr);

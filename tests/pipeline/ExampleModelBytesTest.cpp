@@ -1,0 +1,89 @@
+// The committed example models, written on a little-endian 64-bit host, read
+// the same on every target: each decodes and encodes again to the very bytes
+// of its file, and gives the kernel record whose SHA-1 is fixed below. The
+// digests are the same on every architecture: the record is little-endian by
+// definition.
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <string>
+
+#include "model/OTAParamRC.h"
+#include "pipeline/BatteryModelDataHandler.h"
+#include "pipeline/KextBatteryModel.h"
+#include "pipeline/PBStreamReader.h"
+#include "pipeline/PBStreamWriter.h"
+#include "platform/CommonCrypto.h"
+#include "tests/support/TestDevice.h"
+
+namespace kolvrand {
+namespace {
+
+struct Example {
+  const char* file;
+  uint32_t chemID;
+  const char* recordSHA1;
+};
+
+constexpr Example kExamples[] = {
+    {"examples/models/K517/1821.rcmodel", 0x1821, "83b8e6fb91ab8c06e267bb8bed872113b25a5fa9"},
+    {"examples/models/R70/1552.rcmodel", 0x1552, "82e31811550188d291511afceeabad1880f62221"},
+    {"examples/models/R71/1532.rcmodel", 0x1532, "e43e002abc201d5b3b81e6a19e330ad863e8391b"},
+    {"examples/models/R72/1608a.rcmodel", 0x1608, "7d9bf1503bd5a43e22bee26ef1db71eb1a95b4ce"},
+    {"examples/models/R72/1608b.rcmodel", 0x1608, "7d9bf1503bd5a43e22bee26ef1db71eb1a95b4ce"},
+    {"examples/models/T604/1886.rcmodel", 0x1886, "9ef753e1d66f8cf2ffaa7706f5f3453c27d37788"},
+    {"examples/models/T618e/2168.rcmodel", 0x2168, "1b50f4236af0c0adec44bb492118b90940445413"},
+    {"examples/device/Library/KVR/BatteryModels/T618e/2168.rcmodel", 0x2168,
+     "1b50f4236af0c0adec44bb492118b90940445413"},
+};
+
+std::string hex(const SHA1Digest& digest) {
+  std::string out;
+  char byte[3];
+  for (uint8_t b : digest) std::snprintf(byte, sizeof byte, "%02x", b), out += byte;
+  return out;
+}
+
+std::vector<uint8_t> readExample(const Example& e) {
+  NSError error;
+  auto bytes = PBStreamReader::readFile(std::string(KOLVRAND_SOURCE_DIR) + "/" + e.file, &error);
+  EXPECT_TRUE(bytes) << error.description();
+  return bytes ? *bytes : std::vector<uint8_t>{};
+}
+
+TEST(ExampleModels, DecodeAndEncodeAgainToTheirFileByteForByte) {
+  for (const Example& e : kExamples) {
+    SCOPED_TRACE(e.file);
+    const std::vector<uint8_t> file = readExample(e);
+    NSError error;
+    auto models = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(file, &error);
+    ASSERT_TRUE(models) << error.description();
+    ASSERT_EQ(models->size(), 1u);
+    EXPECT_EQ(models->front()->chemID(), e.chemID);
+    EXPECT_EQ(
+        PBStreamWriter::dataForMessages(std::span<const std::shared_ptr<OTAParamRC>>(*models)),
+        file);
+  }
+}
+
+TEST(ExampleModels, RecordsHaveTheirFixedDigests) {
+  test::TestDevice device;
+  auto handler = BatteryModelDataHandler::init();
+  for (const Example& e : kExamples) {
+    SCOPED_TRACE(e.file);
+    const std::vector<uint8_t> file = readExample(e);
+    NSError error;
+    auto models = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(file, &error);
+    ASSERT_TRUE(models && models->size() == 1) << error.description();
+    auto record = handler->createKextModelFromProtobufModel(models->front().get());
+    ASSERT_TRUE(record);
+    const auto* bytes = reinterpret_cast<const uint8_t*>(record.get());
+    // The chem ID leads the record, least significant byte first.
+    EXPECT_EQ(bytes[0], e.chemID & 0xff);
+    EXPECT_EQ(bytes[1], e.chemID >> 8);
+    EXPECT_EQ(hex(sha1(bytes, kKextBatteryModelSize)), e.recordSHA1);
+  }
+}
+
+}  // namespace
+}  // namespace kolvrand
