@@ -1,6 +1,6 @@
 #include "daemon/BatteryModelTask.h"
 
-#include <vector>
+#include <memory>
 
 #include "pipeline/DaemonIdentifier.h"
 #include "platform/Sysctl.h"
@@ -11,11 +11,14 @@ namespace kolvrand {
 std::optional<std::string> currentBootSessionUUID() {
   size_t size = 0;
   if (sysctlbyname("kern.bootsessionuuid", nullptr, &size, nullptr, 0) != 0) return std::nullopt;
-  // One zero byte beyond the value, so bytes without a NUL still end.
-  std::vector<char> buffer(size + 1, '\0');
-  if (sysctlbyname("kern.bootsessionuuid", buffer.data(), &size, nullptr, 0) != 0)
+  std::unique_ptr<char[]> buffer = allocateKernelStringBuffer(size);
+  if (!buffer || sysctlbyname("kern.bootsessionuuid", buffer.get(), &size, nullptr, 0) != 0)
     return std::nullopt;
-  return stringWithUTF8String(buffer.data());
+  return stringWithUTF8String(buffer.get());
+}
+
+bool isSavedBootSession(const NSUserDefaults& defaults, const std::string& bootUUID) {
+  return defaults.stringForKey("savedBootUUID") == bootUUID;
 }
 
 void runBatteryModelTask(const os_log_t& mainLog, BatteryModelDataHandler* handler) {
@@ -32,7 +35,7 @@ void runBatteryModelTask(const os_log_t& mainLog, BatteryModelDataHandler* handl
     return;
   }
 
-  if (defaults->stringForKey("savedBootUUID") == bootUUID) {
+  if (isSavedBootSession(*defaults, *bootUUID)) {
     os_log(mainLog, "Main Unchanged boot UUID. Skipping battery model task\n");
     return;
   }

@@ -15,6 +15,10 @@ namespace kolvrand {
 // UTF-8.
 std::optional<std::string> currentBootSessionUUID();
 
+// Whether `bootUUID` is the boot session of the last confirmed upload, the
+// one "savedBootUUID" holds: the battery-model task then has nothing to do.
+bool isSavedBootSession(const NSUserDefaults& defaults, const std::string& bootUUID);
+
 // Runs once per process start on the battery-model queue. `handler` may be
 // nil: the chem ID is then 0 and the upload reports false.
 void runBatteryModelTask(const os_log_t& mainLog, BatteryModelDataHandler* handler);

@@ -1,6 +1,9 @@
 // kolvrand: once per boot session, uploads the battery model to the kernel
 // power-management driver; keeps the battery-aging activity registered.
+#include <cstdio>
+#include <optional>
 #include <string>
+#include <string_view>
 
 #include "daemon/BatteryAgingActivity.h"
 #include "daemon/BatteryModelTask.h"
@@ -18,10 +21,40 @@ namespace {
 std::shared_ptr<kolvrand::ConditionCheckingAgent> gAgent;
 std::shared_ptr<kolvrand::BatteryModelDataHandler> gHandler;
 
+constexpr const char* kUsage =
+    "usage: kolvrand [--help | --version]\n"
+    "\n"
+    "The battery-model daemon. Started by systemd (kolvrand.service), it takes no\n"
+    "arguments: once per boot session it uploads the battery model to the\n"
+    "power-management driver and it serves the battery-aging activity (SIGUSR1)\n"
+    "until SIGTERM.\n"
+    "\n"
+    "Environment: KOLVRAND_DEVICE=DIR (a simulated device), KOLVRAND_LOG_LEVEL,\n"
+    "STATE_DIRECTORY. See kolvrand(8).\n";
+
+// --help and --version answer and end; any other argument is a mistake. In
+// both cases nothing of the daemon is touched: no log, no settings, no device.
+std::optional<int> answerArguments(int argc, char** argv) {
+  if (argc < 2) return std::nullopt;
+  const std::string_view arg = argv[1];
+  if (argc == 2 && arg == "--help") {
+    std::fputs(kUsage, stdout);
+    return 0;
+  }
+  if (argc == 2 && arg == "--version") {
+    std::printf("kolvrand %s\n", KOLVRAND_VERSION);
+    return 0;
+  }
+  const bool known = arg == "--help" || arg == "--version";
+  std::fprintf(stderr, "kolvrand: unexpected argument \"%s\"\n%s", argv[known ? 2 : 1], kUsage);
+  return 2;
+}
+
 }  // namespace
 
-int main() {
+int main(int argc, char** argv) {
   using namespace kolvrand;
+  if (std::optional<int> status = answerArguments(argc, argv)) return *status;
 
   os_log_t mainLog = os_log_create(DaemonIdentifier, "main");
 

@@ -32,7 +32,9 @@ class BatteryModelDataHandler : public DaemonAgent<BatteryModelDataHandler> {
   std::optional<std::string> getBatteryModelFileURLString(uint32_t chemID);
   // Where getBatteryModelFileURLString looks, whether or not a file is there;
   // nil (logged under that method's name) without a device type or Library.
-  std::optional<std::string> getBatteryModelFilePath(uint32_t chemID);
+  // *namesFile is false when the device type is no directory name ("", ".",
+  // "..", or with a "/" or a NUL), so that the path names no model file.
+  std::optional<std::string> getBatteryModelFilePath(uint32_t chemID, bool* namesFile = nullptr);
   std::shared_ptr<OTAParamRC> loadProtobufModelWithFileName(
       const std::optional<std::string>& fileName);
 

@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <array>
 #include <cstring>
-#include <vector>
 
 #include "pipeline/BatteryModelDataHandler.h"
 #include "platform/Sysctl.h"
@@ -55,15 +54,14 @@ std::optional<std::string> BatteryModelDataHandler::getDeviceType(uint32_t chemI
     os_log_error(log_, "hw.targettype size could not be read. Returned err %d\n", err);
     return std::nullopt;
   }
-  // One byte more than asked for, always zero, so the value reads as a
-  // C string even when the kernel's bytes carry no NUL.
-  std::vector<char> buffer(size + 1, '\0');
-  err = sysctlbyname("hw.targettype", buffer.data(), &size, nullptr, 0);
+  std::unique_ptr<char[]> buffer = allocateKernelStringBuffer(size);
+  // A size that cannot be had fails like the read itself.
+  err = buffer ? sysctlbyname("hw.targettype", buffer.get(), &size, nullptr, 0) : -1;
   if (err != 0) {
     os_log_error(log_, "Failed to read hw.targettype. Returned err %d\n", err);
     return std::nullopt;
   }
-  const char* text = buffer.data();
+  const char* text = buffer.get();
   os_log_debug(log_, "Read HW type %s\n", text);
   return stringWithUTF8String(text);
 }

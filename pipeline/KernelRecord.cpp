@@ -1,7 +1,9 @@
 // Building the kernel record from a decoded model: straight copies of the
 // first elements of every list. A model that cannot fill the record is refused
 // rather than padded, so no byte of the record is made up.
+#include <algorithm>
 #include <new>
+#include <string>
 
 #include "model/OTAParamRC.h"
 #include "model/Wire.h"
@@ -15,36 +17,25 @@ namespace {
 
 constexpr const char* kMethod = "-[BatteryModelDataHandler createKextModelFromProtobufModel:]";
 
-// Logs every table the model lacks and every list shorter than the record's
-// count; true when there is none.
+// Logs the first table the model lacks or list shorter than the record's
+// count, with how many more there are (one line a boot, however bare the
+// model; rcmodel validate lists them all); true when there is none.
 bool modelFillsRecord(const OTAParamRC& model, const os_log_t& log) {
-  bool fills = true;
-  for (const KextTableSource& t : kextTableSources()) {
-    const OTAResistanceData* table = t.table(model);
-    if (!table) {
-      os_log_error(log, "%s <Error> %s nil: the record needs all 17 resistance tables", kMethod,
-                   t.field);
-      fills = false;
-      continue;
-    }
-    for (const KextTableListSource& l : kextTableListSources()) {
-      size_t held = l.elements(*table).size();
-      if (held < l.count) {
-        os_log_error(log, "%s <Error> %s.%s holds %zu elements, the record carries %zu", kMethod,
-                     t.field, l.field, held, l.count);
-        fills = false;
-      }
-    }
-  }
-  for (const KextListSource& l : kextListSources()) {
-    size_t held = l.elements(model).size();
-    if (held < l.count) {
-      os_log_error(log, "%s <Error> %s holds %zu elements, the record carries %zu", kMethod,
-                   l.field, held, l.count);
-      fills = false;
-    }
-  }
-  return fills;
+  const std::vector<KextListCheck> checks = checkKextLists(model);
+  auto first = std::find_if(checks.begin(), checks.end(), [](auto& c) { return !c.fills(); });
+  if (first == checks.end()) return true;
+  const auto others = std::count_if(first + 1, checks.end(), [](auto& c) { return !c.fills(); });
+  std::string more;
+  if (others > 0)
+    more = "; " + std::to_string(others) + (others == 1 ? " more shortfall" : " more shortfalls") +
+           ", rcmodel validate lists them";
+  if (!first->list)
+    os_log_error(log, "%s <Error> %s nil: the record needs all %zu resistance tables%s", kMethod,
+                 first->table, kextTableSources().size(), more);
+  else
+    os_log_error(log, "%s <Error> %s holds %zu elements, the record carries %zu%s", kMethod,
+                 first->name(), first->held, first->carried, more);
+  return false;
 }
 
 // The record is little-endian on every host; modelFillsRecord has checked that

@@ -7,9 +7,10 @@ namespace kolvrand {
 
 namespace {
 
+// The record's field is named as the dictionary key of its list.
 #define KEXT_LIST(list, recordField)                                                                 \
   KextListSource {                                                                                   \
-#list, offsetof(KextBatteryModel, recordField),                                                  \
+#recordField, offsetof(KextBatteryModel, recordField),                                                  \
         sizeof(KextBatteryModel::recordField) / sizeof(LEFloat),                                     \
         [](const OTAParamRC&                                                                         \
                m) { return std::span<const float>(m.list(), static_cast<size_t>(m.list##Count())); } \
@@ -41,41 +42,41 @@ constexpr KextListSource kLists[] = {
 };
 #undef KEXT_LIST
 
-#define KEXT_TABLE(field)                                                               \
+#define KEXT_TABLE(field, key)                                                          \
   KextTableSource {                                                                     \
-#field, offsetof(KextBatteryModel, field),                                          \
+    key, offsetof(KextBatteryModel, field),                                             \
         [](const OTAParamRC& m) -> const OTAResistanceData* { return m.field().get(); } \
   }
 
 constexpr KextTableSource kTables[] = {
-    KEXT_TABLE(r0),
-    KEXT_TABLE(r1),
-    KEXT_TABLE(r2),
-    KEXT_TABLE(r3),
-    KEXT_TABLE(rCFreq1),
-    KEXT_TABLE(rCFreq2),
-    KEXT_TABLE(rCFreq3),
-    KEXT_TABLE(rCFreq4),
-    KEXT_TABLE(baselineR0),
-    KEXT_TABLE(baselineR1),
-    KEXT_TABLE(baselineR2),
-    KEXT_TABLE(baselineR3),
-    KEXT_TABLE(baselineR4),
-    KEXT_TABLE(baselineRCFreq1),
-    KEXT_TABLE(baselineRCFreq2),
-    KEXT_TABLE(baselineRCFreq3),
-    KEXT_TABLE(baselineRCFreq4),
+    KEXT_TABLE(r0, "R0"),
+    KEXT_TABLE(r1, "R1"),
+    KEXT_TABLE(r2, "R2"),
+    KEXT_TABLE(r3, "R3"),
+    KEXT_TABLE(rCFreq1, "RCFreq1"),
+    KEXT_TABLE(rCFreq2, "RCFreq2"),
+    KEXT_TABLE(rCFreq3, "RCFreq3"),
+    KEXT_TABLE(rCFreq4, "RCFreq4"),
+    KEXT_TABLE(baselineR0, "baselineR0"),
+    KEXT_TABLE(baselineR1, "baselineR1"),
+    KEXT_TABLE(baselineR2, "baselineR2"),
+    KEXT_TABLE(baselineR3, "baselineR3"),
+    KEXT_TABLE(baselineR4, "baselineR4"),
+    KEXT_TABLE(baselineRCFreq1, "baselineRCFreq1"),
+    KEXT_TABLE(baselineRCFreq2, "baselineRCFreq2"),
+    KEXT_TABLE(baselineRCFreq3, "baselineRCFreq3"),
+    KEXT_TABLE(baselineRCFreq4, "baselineRCFreq4"),
 };
 #undef KEXT_TABLE
 
 constexpr KextTableListSource kTableLists[] = {
-    {"resistance25Cs", offsetof(KextResistanceTable, resistance25C),
+    {"resistance25C", offsetof(KextResistanceTable, resistance25C),
      KextResistanceTable::kResistance25CCount,
      [](const OTAResistanceData& t) {
        return std::span<const float>(t.resistance25Cs(),
                                      static_cast<size_t>(t.resistance25CsCount()));
      }},
-    {"temperatureCoeffs", offsetof(KextResistanceTable, temperatureCoeff),
+    {"temperatureCoeff", offsetof(KextResistanceTable, temperatureCoeff),
      KextResistanceTable::kTemperatureCoeffCount,
      [](const OTAResistanceData& t) {
        return std::span<const float>(t.temperatureCoeffs(),
@@ -93,6 +94,29 @@ std::span<const KextTableSource> kextTableSources() {
 }
 std::span<const KextTableListSource> kextTableListSources() {
   return kTableLists;
+}
+
+std::string KextListCheck::name() const {
+  if (!table) return list;
+  if (!list) return table;
+  return std::string(table) + "." + list;
+}
+
+std::vector<KextListCheck> checkKextLists(const OTAParamRC& model) {
+  std::vector<KextListCheck> checks;
+  checks.reserve(std::size(kTables) * (1 + std::size(kTableLists)) + std::size(kLists));
+  for (const KextTableSource& t : kTables) {
+    const OTAResistanceData* table = t.table(model);
+    if (!table) {
+      checks.push_back({t.field, nullptr, 0, 0});
+      continue;
+    }
+    for (const KextTableListSource& l : kTableLists)
+      checks.push_back({t.field, l.field, l.elements(*table).size(), l.count});
+  }
+  for (const KextListSource& l : kLists)
+    checks.push_back({nullptr, l.field, l.elements(model).size(), l.count});
+  return checks;
 }
 
 }  // namespace kolvrand

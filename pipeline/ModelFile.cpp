@@ -1,5 +1,6 @@
 // Locating the model file for the battery and decoding its first message.
 #include <cstdio>
+#include <string_view>
 
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
@@ -9,11 +10,23 @@
 namespace kolvrand {
 
 namespace {
+
 constexpr const char* kFileURLMethod = "-[BatteryModelDataHandler getBatteryModelFileURLString:]";
+
+// A device type is one directory below KVR/BatteryModels. Whoever can set the
+// target type must not be able to point the daemon at a file of their
+// choosing elsewhere; symlinks that whoever installs models puts inside the
+// Library stay theirs to place.
+bool isDirectoryName(std::string_view type) {
+  return !type.empty() && type != "." && type != ".." &&
+         type.find_first_of(std::string_view("/\0", 2)) == std::string_view::npos;
 }
 
+}  // namespace
+
 // The first half of getBatteryModelFileURLString, so its lines carry that name.
-std::optional<std::string> BatteryModelDataHandler::getBatteryModelFilePath(uint32_t chemID) {
+std::optional<std::string> BatteryModelDataHandler::getBatteryModelFilePath(uint32_t chemID,
+                                                                            bool* namesFile) {
   static constexpr const char* kMethod = kFileURLMethod;
   NSFileManager& fileManager = NSFileManager::defaultManager();
 
@@ -31,29 +44,26 @@ std::optional<std::string> BatteryModelDataHandler::getBatteryModelFilePath(uint
   // Only now, once a device type and a root are known, is the serial number read.
   const std::string suffix = getSpecialCaseBatteryModelIdentifier(chemID);
 
-  char fileName[16];
-  std::snprintf(fileName, sizeof fileName, "%x", chemID);
-  const std::string name = std::string(fileName) + suffix + ".rcmodel";
-  // A device type that is one plain name joins the root as a string, which
-  // gives what appending path components gives, without their parsing.
-  const std::string& type = *deviceType;
-  if (!type.empty() && type.find('/') == std::string::npos && !workingDirURL->empty()) {
-    std::string path = workingDirURL->native();
-    if (path.back() != '/') path += '/';
-    path.append("KVR/BatteryModels/").append(type).append("/").append(name);
-    return path;
-  }
-  const NSURL url = *workingDirURL / "KVR" / "BatteryModels" / type / name;
-  return url.string();
+  char chem[16];
+  std::snprintf(chem, sizeof chem, "%x", chemID);
+  // Joined as text, never resolved, so a device type that is no directory
+  // name shows in the log as it came.
+  std::string path = workingDirURL->native();
+  if (!path.empty() && path.back() != '/') path += '/';
+  path.append("KVR/BatteryModels/").append(*deviceType).append("/");
+  path.append(chem).append(suffix).append(".rcmodel");
+  if (namesFile) *namesFile = isDirectoryName(*deviceType);
+  return path;
 }
 
 std::optional<std::string> BatteryModelDataHandler::getBatteryModelFileURLString(uint32_t chemID) {
   static constexpr const char* kMethod = kFileURLMethod;
-  std::optional<std::string> path = getBatteryModelFilePath(chemID);
+  bool namesFile = false;
+  std::optional<std::string> path = getBatteryModelFilePath(chemID, &namesFile);
   if (!path) return std::nullopt;
 
   os_log_debug(log_, "%s workingDirURL resource: %@ \n", kMethod, *path);
-  if (!NSFileManager::defaultManager().fileExistsAtPath(*path)) {
+  if (!namesFile || !NSFileManager::defaultManager().fileExistsAtPath(*path)) {
     os_log_error(log_, "%s <Error> file not present: %@", kMethod, *path);
     return std::nullopt;
   }

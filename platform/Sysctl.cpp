@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <new>
 
 #include "platform/Backend.h"
 
@@ -36,6 +37,11 @@ int sysctlbyname(const char* name, void* oldp, size_t* oldlenp, const void* newp
   std::memcpy(oldp, value->data(), value->size());
   *oldlenp = value->size();
   return 0;
+}
+
+std::unique_ptr<char[]> allocateKernelStringBuffer(size_t size) {
+  if (size > kMaxKernelStringSize) return nullptr;
+  return std::unique_ptr<char[]>(new (std::nothrow) char[size + 1]());
 }
 
 }  // namespace kolvrand

@@ -208,10 +208,17 @@ TEST(KextBatteryModel, NullOrShortModelsAreRefusedWithTheirReasons) {
   model->r1()->setTemperatureCoeffs(model->r1()->temperatureCoeffs(), 152);
   model->clearSlopeForR3Extraps();
   EXPECT_FALSE(handler->createKextModelFromProtobufModel(model.get()));
+  // The first shortfall in record order, named as authors write it, and how
+  // many more there are: one line a boot however bare the model.
   EXPECT_EQ(device.logLines(),
-            (Lines{prefix + "r1.temperatureCoeffs holds 152 elements, the record carries 153",
-                   prefix + "baselineRCFreq4 nil: the record needs all 17 resistance tables",
-                   prefix + "slopeForR3Extraps holds 0 elements, the record carries 51"}));
+            Lines{prefix + "R1.temperatureCoeff holds 152 elements, the record carries 153; 2 "
+                           "more shortfalls, rcmodel validate lists them"});
+  device.clearLog();
+  const OTAParamRC empty;
+  EXPECT_FALSE(handler->createKextModelFromProtobufModel(&empty));
+  EXPECT_EQ(device.logLines(), Lines{prefix + "R0 nil: the record needs all 17 resistance "
+                                              "tables; 38 more shortfalls, rcmodel validate "
+                                              "lists them"});
 }
 
 }  // namespace

@@ -7,6 +7,7 @@
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/PBStreamReader.h"
+#include "platform/Sysctl.h"
 #include "tests/support/ModelFiles.h"
 #include "tests/support/TestDevice.h"
 
@@ -49,6 +50,10 @@ TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
       {nullptr,
        std::nullopt,
        {"error " + kHandler + "hw.targettype size could not be read. Returned err -1"}},
+      // A size no target type has fails as a read does, never by throwing.
+      {std::string(kMaxKernelStringSize + 1, 'J'),
+       std::nullopt,
+       {"error " + kHandler + "Failed to read hw.targettype. Returned err -1"}},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.targetType.dump());
@@ -65,6 +70,13 @@ TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
       EXPECT_EQ(device.logLines(), c.lines) << chemID;
     }
   }
+}
+
+TEST(DeviceType, KernelStringBufferOfAnySizeIsAllocatedOrRefused) {
+  EXPECT_TRUE(allocateKernelStringBuffer(0));
+  EXPECT_TRUE(allocateKernelStringBuffer(kMaxKernelStringSize));
+  EXPECT_FALSE(allocateKernelStringBuffer(kMaxKernelStringSize + 1));
+  EXPECT_FALSE(allocateKernelStringBuffer(SIZE_MAX));  // size + 1 would wrap
 }
 
 TEST(ModelFilePath, DeviceTypeChemIDAndSuffixNameTheFile) {

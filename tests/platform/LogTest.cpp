@@ -100,11 +100,12 @@ TEST(LogLevels, EnablesLevelsPerCategory) {
       {"debug,main=error", "other", LogLevel::Debug, true},
       // A later bare level overrides earlier per-category items.
       {"main=debug,error", "main", LogLevel::Default, false},
-      {" main = debug , x=error", "main", LogLevel::Debug, true},
-      {" main = debug , x=error", "x", LogLevel::Default, false},
-      // Unknown items are ignored and the default stays.
-      {"verbose,main=loud,=debug", "main", LogLevel::Default, true},
-      {"verbose,main=loud,=debug", "main", LogLevel::Debug, false},
+      {" main = debug , dispatch=error", "main", LogLevel::Debug, true},
+      {" main = debug , dispatch=error", "dispatch", LogLevel::Default, false},
+      // Unknown items are skipped (the daemon warns of them and keeps the
+      // defaults).
+      {"verbose,main=loud,=debug,x=debug", "main", LogLevel::Default, true},
+      {"verbose,main=loud,=debug,x=debug", "x", LogLevel::Debug, false},
   };
   for (const auto& c : cases) {
     setLogLevelSpec(c.levels);

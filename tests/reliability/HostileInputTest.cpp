@@ -204,7 +204,7 @@ TEST(HostileModelFile, GroupsNestedAsDeepAsAllowedStillRead) {
   writeAll(device.path(kModel), nestedGroups(64));
   Lines lines = runDaemon(device, Outcome::Failed);
   // Read, then refused only because an empty model cannot fill the record.
-  EXPECT_TRUE(contains(lines, "createKextModelFromProtobufModel:] <Error> r0 nil"))
+  EXPECT_TRUE(contains(lines, "createKextModelFromProtobufModel:] <Error> R0 nil"))
       << testing::PrintToString(lines);
 }
 
@@ -228,7 +228,7 @@ TEST(HostileModelFile, MillionsOfEmptyMessagesCostNoMemory) {
   daemon.signal(SIGTERM);
   EXPECT_EQ(daemon.waitForExit(), 0);
   // The daemon read it as the empty model it is.
-  EXPECT_TRUE(contains(daemon.lines(), "createKextModelFromProtobufModel:] <Error> r0 nil"))
+  EXPECT_TRUE(contains(daemon.lines(), "createKextModelFromProtobufModel:] <Error> R0 nil"))
       << daemon.rawStderr();
 }
 

@@ -29,17 +29,21 @@ class DaemonProcess {
   // `launcher`, when given, is a command that runs the daemon in its place
   // (its first word an absolute path), such as setpriv to drop privileges.
   DaemonProcess(const std::filesystem::path& device, const std::string& logLevel = "debug",
-                std::vector<std::string> launcher = {})
-      : stderrPath_(device / "daemon.stderr") {
+                std::vector<std::string> launcher = {}, std::vector<std::string> args = {})
+      : stderrPath_(device / "daemon.stderr"), stdoutPath_(device / "daemon.stdout") {
     const DaemonEnvironment env(device, logLevel);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_addopen(&actions, 2, stderrPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
                                      0644);
+    posix_spawn_file_actions_addopen(&actions, 1, stdoutPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
+                                     0644);
     launcher.push_back(daemonBinary().string());
+    launcher.insert(launcher.end(), args.begin(), args.end());
     // A previous run's stderr must not be read as this one's: posix_spawn may
     // return before the child has opened the file (it does under qemu-user).
     std::filesystem::remove(stderrPath_);
+    std::filesystem::remove(stdoutPath_);
     std::vector<char*> argv;
     for (auto& s : launcher) argv.push_back(s.data());
     argv.push_back(nullptr);
@@ -75,12 +79,8 @@ class DaemonProcess {
     return -1;
   }
 
-  std::string rawStderr() const {
-    std::ifstream in(stderrPath_);
-    std::stringstream s;
-    s << in.rdbuf();
-    return s.str();
-  }
+  std::string rawStderr() const { return readAll(stderrPath_); }
+  std::string rawStdout() const { return readAll(stdoutPath_); }
 
   // Lines as "LEVEL [category] text"; false when a line lacks the exact
   // "kolvrand[PID]: " prefix.
@@ -113,7 +113,14 @@ class DaemonProcess {
   }
 
  private:
-  std::filesystem::path stderrPath_;
+  static std::string readAll(const std::filesystem::path& path) {
+    std::ifstream in(path);
+    std::stringstream s;
+    s << in.rdbuf();
+    return s.str();
+  }
+
+  std::filesystem::path stderrPath_, stdoutPath_;
   pid_t pid_ = -1;
   bool running_ = false;
 };

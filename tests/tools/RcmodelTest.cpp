@@ -3,9 +3,12 @@
 // plot, and status on simulated devices.
 #include <gtest/gtest.h>
 
+#include <sys/stat.h>
 #include <algorithm>
+
 #include <regex>
 #include <span>
+#include <thread>
 
 #include "daemon/BatteryModelTask.h"
 #include "model/OTAParamRC.h"
@@ -90,17 +93,28 @@ TEST(Rcmodel, RandomModelsRoundTripThroughJSON) {
   }
 }
 
-TEST(Rcmodel, EncodeOfDecodeGivesTheSameFile) {
+// decode | encode gives back every file decode accepts, whatever number of
+// messages it holds; a file of none is no model file either way.
+TEST(Rcmodel, DecodeThenEncodeGivesTheSameFile) {
   Scratch scratch;
-  for (const char* example :
-       {"examples/models/R72/1608a.rcmodel", "examples/models/K517/1821.rcmodel"}) {
-    const fs::path file = fs::path(KOLVRAND_SOURCE_DIR) / example;
-    ToolRun decode = scratch.rcmodel({"decode", file.string()});
+  auto file = [](const char* example) {
+    return readWhole(fs::path(KOLVRAND_SOURCE_DIR) / "examples/models" / example);
+  };
+  const std::string one = file("R72/1608a.rcmodel");
+  const std::string several = one + file("K517/1821.rcmodel") + file("T604/1886.rcmodel");
+  for (const std::string& bytes : {one, several}) {
+    writeWhole(scratch / "in.rcmodel", bytes);
+    ToolRun decode = scratch.rcmodel({"decode", "in.rcmodel"});
     ASSERT_EQ(decode.status, 0) << decode.err;
     ToolRun encode = scratch.rcmodel({"encode", "-", "-o", "again.rcmodel"}, decode.out);
     ASSERT_EQ(encode.status, 0) << encode.err;
-    EXPECT_EQ(readWhole(scratch / "again.rcmodel"), readWhole(file)) << example;
+    EXPECT_EQ(readWhole(scratch / "again.rcmodel"), bytes);
   }
+  writeWhole(scratch / "none.rcmodel", "");
+  ToolRun decode = scratch.rcmodel({"decode", "none.rcmodel"});
+  EXPECT_EQ(decode.status, 1);
+  EXPECT_EQ(scratch.rcmodel({"encode", "-", "-o", "none.again"}, decode.out).status, 2);
+  EXPECT_FALSE(fs::exists(scratch / "none.again"));
 }
 
 // What each wrong use prints and returns. Files named here are made by the
@@ -144,7 +158,11 @@ TEST(Rcmodel, ExitCodesAndMessages) {
        "^rcmodel decode: cut.rcmodel: message 0 at offset 0 claims [0-9]+ bytes but only [0-9]+ "
        "remain in the file; if it holds one bare message without its length, use --raw\n$",
        "^$"},
-      {{"decode", "empty.rcmodel"}, "", 0, "", "^$"},
+      {{"decode", "empty.rcmodel"},
+       "",
+       1,
+       "^rcmodel decode: empty.rcmodel: holds no message; a model file holds at least one",
+       "^$"},
       {{"encode", "bad.json"}, "", 2, "give the model file to write with -o FILE", ""},
       {{"encode", "bad.json", "-o", "out.rcmodel"},
        "",
@@ -159,13 +177,32 @@ TEST(Rcmodel, ExitCodesAndMessages) {
        "stdin: \\$: expected one object",
        "^$"},
       {{"encode", "nothere.json", "-o", "out.rcmodel"}, "", 2, "nothere.json: cannot open", ""},
+      // Nothing may follow the JSON, not even behind a NUL byte.
+      {{"encode", "-", "-o", "out.rcmodel"},
+       std::string("{}\n\0{\"chemID\": 1}", 16),
+       2,
+       "stdin: \\$: not valid JSON: a NUL byte at line 2, column 1; nothing was written",
+       "^$"},
+      {{"encode", "-", "-o", "out.rcmodel"}, "{} x", 2, "at line 1, column 4: syntax error", "^$"},
+      {{"encode", "-", "-o", "out.rcmodel"},
+       "{}\n{}\n\n{\"chemID\": x}\n",
+       2,
+       "at line 4, column 12: syntax error",
+       "^$"},
+      {{"encode", "-", "-o", "out.rcmodel"},
+       "{}\n{\"gridOCV\": [1, 1e39]}\n",
+       2,
+       "stdin: line 2: \\$.gridOCV\\[1\\]: 1e39 is out of range for a 32-bit float",
+       "^$"},
+      {{"encode", "-", "-o", "out.rcmodel"}, "[]", 2, "holds no model; a model file holds", "^$"},
+      {{"encode", "--raw", "-", "-o", "out.rcmodel"}, "{}\n{}\n", 2, "expected one object", "^$"},
       {{"record"}, "", 2, "give one model file", ""},
       {{"record", "good.rcmodel"}, "", 0, "", "^[0-9a-f]{40}\n$"},
       {{"record", "short.rcmodel", "-o", "out.bin"},
        "",
        1,
        "^rcmodel record: -\\[BatteryModelDataHandler createKextModelFromProtobufModel:\\] <Error> "
-       "r0 nil: the record needs all 17 resistance tables\nrcmodel record: short.rcmodel: the "
+       "R0 nil: the record needs all 17 resistance tables\nrcmodel record: short.rcmodel: the "
        "daemon would refuse this model \\(see above\\); rcmodel validate short.rcmodel lists",
        "^$"},
       {{"record", "empty.rcmodel"},
@@ -178,7 +215,7 @@ TEST(Rcmodel, ExitCodesAndMessages) {
        "",
        1,
        "cut.rcmodel: message 0",
-       "good.rcmodel\n[\\s\\S]*ok: the daemon would load it[\\s\\S]*\n\nshort.rcmodel\n[\\s\\S]*r0 "
+       "good.rcmodel\n[\\s\\S]*ok: the daemon would load it[\\s\\S]*\n\nshort.rcmodel\n[\\s\\S]*R0 "
        "+- +- +MISSING"
        "[\\s\\S]*refused[\\s\\S]*\n\ncut.rcmodel\n  decodes: no"},
       {{"plot", "good.rcmodel"}, "", 2, "give the picture to write with -o OUT.svg", ""},
@@ -208,6 +245,77 @@ TEST(Rcmodel, ExitCodesAndMessages) {
     EXPECT_EQ(help.status, 0) << command;
     EXPECT_TRUE(help.out.starts_with(std::string("usage: rcmodel ") + command)) << help.out;
   }
+}
+
+// Every command that writes treats its output path alike: "-" is standard
+// output, a symlink (dangling or not) is written through and stays a link, a
+// FIFO is written in place for its reader, and a file that cannot be replaced
+// keeps its old content while one line says why.
+TEST(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
+  Scratch scratch;
+  fs::permissions(scratch.dir(), fs::perms(0755));
+  writeWhole(scratch / "m.rcmodel", exampleModelFile());
+  writeWhole(scratch / "m.json", "{\"chemID\": 8552}");
+  // The directory a user cannot write to; root is let through, so the
+  // command is run as nobody then.
+  fs::create_directory(scratch / "ro");
+  writeWhole(scratch / "ro/out", "old");
+  fs::permissions(scratch / "ro", fs::perms(0555));
+  const std::vector<std::string> asUser =
+      geteuid() == 0 ? std::vector<std::string>{"/usr/bin/setpriv", "--reuid=65534",
+                                                "--regid=65534", "--clear-groups"}
+                     : std::vector<std::string>{};
+
+  struct Command {
+    std::vector<std::string> args;  // followed by -o OUT
+  } const commands[] = {{{"encode", "m.json"}}, {{"record", "m.rcmodel"}}, {{"plot", "m.rcmodel"}}};
+  for (const Command& c : commands) {
+    SCOPED_TRACE(c.args.front());
+    auto run = [&](const std::string& out, std::vector<std::string> launcher = {}) {
+      std::vector<std::string> args = c.args;
+      args.insert(args.end(), {"-o", out});
+      scratch.launcher = std::move(launcher);
+      ToolRun r = scratch.rcmodel(args);
+      scratch.launcher.clear();
+      return r;
+    };
+    ASSERT_EQ(run("plain").status, 0);
+    const std::string expected = readWhole(scratch / "plain");
+    ASSERT_FALSE(expected.empty());
+
+    fs::remove(scratch / "target"), fs::remove(scratch / "link");
+    writeWhole(scratch / "target", "old");
+    fs::create_symlink("target", scratch / "link");
+    EXPECT_EQ(run("link").status, 0);
+    EXPECT_TRUE(fs::is_symlink(scratch / "link"));
+    EXPECT_EQ(readWhole(scratch / "target"), expected);
+
+    fs::remove(scratch / "target");
+    EXPECT_EQ(run("link").status, 0) << "dangling";
+    EXPECT_TRUE(fs::is_symlink(scratch / "link"));
+    EXPECT_EQ(readWhole(scratch / "target"), expected);
+
+    fs::remove(scratch / "fifo");
+    ASSERT_EQ(mkfifo((scratch / "fifo").c_str(), 0644), 0);
+    std::string heard;
+    std::thread reader([&] { heard = readWhole(scratch / "fifo"); });
+    EXPECT_EQ(run("fifo").status, 0);
+    reader.join();
+    EXPECT_TRUE(fs::is_fifo(scratch / "fifo"));
+    EXPECT_EQ(heard, expected);
+
+    ToolRun toStdout = run("-");
+    EXPECT_EQ(toStdout.status, 0);
+    EXPECT_EQ(toStdout.out, expected);
+
+    ToolRun denied = run("ro/out", asUser);
+    EXPECT_EQ(denied.status, 1);
+    EXPECT_EQ(std::count(denied.err.begin(), denied.err.end(), '\n'), 1) << denied.err;
+    EXPECT_NE(denied.err.find("ro/out: cannot write: Permission denied"), std::string::npos)
+        << denied.err;
+    EXPECT_EQ(readWhole(scratch / "ro/out"), "old");
+  }
+  fs::permissions(scratch / "ro", fs::perms(0755));
 }
 
 TEST(Rcmodel, RawDecodePrintsWhatWasReadBeforeTheBreak) {
@@ -267,11 +375,11 @@ TEST(Rcmodel, ValidateReportsEveryListAgainstTheRecord) {
   EXPECT_EQ(run.status, 1);
   const std::string expected[] = {
       "decodes: yes, 2 messages; the daemon uses the first",
-      "gridOCVs +300 +303  SHORT: 3 missing, the daemon refuses this",
-      "agingCoeffForR1s +110 +102  8 beyond the record, dropped",
-      "rCFreq4 +- +-  MISSING: the record needs all 17 resistance tables",
-      "r0.resistance25Cs +51 +51  ok",
-      "r0.temperatureCoeffs +153 +153  ok",
+      "gridOCV +300 +303  SHORT: 3 missing, the daemon refuses this",
+      "agingCoeffForR1 +110 +102  8 beyond the record, dropped",
+      "RCFreq4 +- +-  MISSING: the record needs all 17 resistance tables",
+      "R0.resistance25C +51 +51  ok",
+      "R0.temperatureCoeff +153 +153  ok",
       "note: MLBConfig not set; the record carries 0",
       "refused: the daemon would not load this model",
   };
@@ -372,6 +480,14 @@ TEST(Rcmodel, StatusFollowsTheDaemon) {
   EXPECT_EQ(field(report, "verdict"), "missing") << report;
   EXPECT_EQ(field(report, "model file exists"), "no");
 
+  // What the daemon would refuse to read, status does not call a model file.
+  fs::create_directory(device.dir() / "Library/KVR/BatteryModels" / modelPath);
+  report = status();
+  EXPECT_EQ(field(report, "model file exists"), "no, not a regular file");
+  EXPECT_EQ(field(report, "verdict"), "missing") << report;
+  EXPECT_NE(report.find(": not a regular file\n"), std::string::npos) << report;
+  fs::remove(device.dir() / "Library/KVR/BatteryModels" / modelPath);
+
   // A model the record builder refuses.
   auto incomplete = makeExampleModel(0x2168);
   incomplete->clearGridOCVs();
@@ -381,7 +497,7 @@ TEST(Rcmodel, StatusFollowsTheDaemon) {
   EXPECT_EQ(field(report, "record SHA-1"), "(refused by the record builder)");
   // With the builder's reason.
   EXPECT_NE(report.find("\nthe daemon's code logged:\n  -[BatteryModelDataHandler "
-                        "createKextModelFromProtobufModel:] <Error> gridOCVs holds 0 elements, "
+                        "createKextModelFromProtobufModel:] <Error> gridOCV holds 0 elements, "
                         "the record carries 303\n"),
             std::string::npos)
       << report;

@@ -51,6 +51,9 @@ class Scratch {
   Scratch& operator=(const Scratch&) = delete;
 
   const std::filesystem::path& dir() const { return dir_; }
+  // A command that runs rcmodel in its place (its first word an absolute
+  // path), such as setpriv to drop root's privileges.
+  std::vector<std::string> launcher;
   std::filesystem::path operator/(const std::string& name) const { return dir_ / name; }
 
   // rcmodel ARGS in this directory, with `input` on stdin. KOLVRAND_DEVICE
@@ -69,7 +72,8 @@ class Scratch {
     envp.push_back(nullptr);
 
     std::string binary = rcmodelBinary().string();
-    std::vector<std::string> argStrings = {binary};
+    std::vector<std::string> argStrings = launcher;
+    argStrings.push_back(binary);
     argStrings.insert(argStrings.end(), args.begin(), args.end());
     std::vector<char*> argv;
     for (auto& s : argStrings) argv.push_back(s.data());
@@ -85,7 +89,7 @@ class Scratch {
     posix_spawn_file_actions_addchdir_np(&actions, dir_.c_str());
     ToolRun run;
     pid_t pid = -1;
-    if (posix_spawn(&pid, binary.c_str(), &actions, nullptr, argv.data(), envp.data()) == 0) {
+    if (posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), envp.data()) == 0) {
       int status = 0;
       waitpid(pid, &status, 0);
       run.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);

@@ -23,8 +23,8 @@ float; NaN and the infinities as "NaN", "Infinity" and "-Infinity".
           the message breaks off; the exit status is then 1.
 
 Exit status: 0 when every message decodes; 1 when the file cannot be read or
-decoded (the stream reader's description goes to stderr); 2 for a wrong command
-line.
+decoded (the stream reader's description goes to stderr) or holds no message;
+2 for a wrong command line.
 )HELP";
 
 void print(const OTAParamRC& model) {
@@ -33,15 +33,7 @@ void print(const OTAParamRC& model) {
   std::fwrite(line.data(), 1, line.size(), stdout);
 }
 
-}  // namespace
-
-int runDecode(const std::vector<std::string>& args) {
-  Arguments a{"decode"};
-  if (!a.parse(args, {"--raw"})) return kExitUsage;
-  if (a.help) {
-    std::fputs(kHelp, stdout);
-    return kExitOK;
-  }
+int run(const Arguments& a) {
   if (a.operands.size() != 1) return usageError(a.command, "give one model file, or - for stdin");
   const std::string& path = a.operands.front();
 
@@ -73,8 +65,16 @@ int runDecode(const std::vector<std::string>& args) {
                          "; if it holds one bare message without its length, use --raw");
     return kExitFailed;
   }
+  if (models->empty()) {
+    error(a.command, path + ": " + kNoMessage);
+    return kExitFailed;
+  }
   for (const auto& model : *models) print(*model);
   return std::fflush(stdout) == 0 ? kExitOK : kExitFailed;
 }
+
+}  // namespace
+
+const Command kDecode{"decode", kHelp, kRawOption, run};
 
 }  // namespace kolvrand::rcmodel

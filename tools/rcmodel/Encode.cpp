@@ -14,13 +14,16 @@ namespace {
 constexpr const char* kHelp = R"HELP(usage: rcmodel encode [--raw] JSON|- -o FILE
 
 Writes the model file FILE (- for standard output) from the JSON file JSON (or
-standard input): an object is one OTAParamRC message, an array of objects
-several, each written with its length in front as the daemon reads them. The
-JSON is what rcmodel decode prints, and decoding FILE gives it back.
+standard input): an object is one OTAParamRC message; an array of objects, or
+one object a line (JSON Lines, what rcmodel decode prints), several; each is
+written with its length in front as the daemon reads them. A model file holds
+at least one message, and decoding FILE gives the JSON back.
 
   --raw       JSON is one object, written as one bare message without its
               length (what protoc --decode reads).
   -o FILE     the file to write; nothing is written when the JSON is wrong.
+              A symlink is written through; a FIFO or a device is written in
+              place; a file is replaced whole or, on failure, left as it was.
 
 Keys are those of the dictionary form; a key left out leaves its field unset
 (chemID then is 0). Floats are any JSON number within a float's range, rounded
@@ -32,15 +35,7 @@ Exit status: 0 when FILE was written; 1 when it could not be written; 2 for a
 wrong command line or wrong JSON, with the JSON path of the first wrong value.
 )HELP";
 
-}  // namespace
-
-int runEncode(const std::vector<std::string>& args) {
-  Arguments a{"encode"};
-  if (!a.parse(args, {"--raw", "-o"})) return kExitUsage;
-  if (a.help) {
-    std::fputs(kHelp, stdout);
-    return kExitOK;
-  }
+int run(const Arguments& a) {
   if (a.operands.size() != 1) return usageError(a.command, "give one JSON file, or - for stdin");
   if (!a.output) return usageError(a.command, "give the model file to write with -o FILE");
   const std::string& path = a.operands.front();
@@ -72,5 +67,9 @@ int runEncode(const std::vector<std::string>& args) {
     return kExitFailed;
   return kExitOK;
 }
+
+}  // namespace
+
+const Command kEncode{"encode", kHelp, kRawOption | kOutputOption, run};
 
 }  // namespace kolvrand::rcmodel

@@ -1,7 +1,9 @@
 #include "tools/rcmodel/ModelJSON.h"
 
+#include <algorithm>
 #include <charconv>
 #include <cmath>
+#include <cstdlib>
 #include <limits>
 #include <nlohmann/json.hpp>
 
@@ -57,6 +59,12 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
  public:
   std::optional<Value> root;
   JSONError error;
+  // Where the text is one line of several (JSON Lines): its number, for the
+  // parser's locations, which count from the slice it was given.
+  size_t line = 1;
+  // Set to a value's path to have the number there kept as written.
+  std::optional<std::string> wantedPath;
+  std::string writtenText;
 
   bool null() override { return fail("null is no value here; leave the key out instead"); }
   bool boolean(bool value) override { return add(Value(value)); }
@@ -67,6 +75,7 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
     return add(Value(Number::fromUnsigned(value)));
   }
   bool number_float(number_float_t value, const string_t& text) override {
+    if (wantedPath && currentPath() == *wantedPath) writtenText = text;
     if (!std::isfinite(value)) return fail("the number " + text + " is out of range");
     // The float nearest to the decimal text, rounded once; the parser's double
     // rounded to a float could differ in the last bit.
@@ -108,7 +117,18 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
     if (what.starts_with("[json.exception.")) {
       if (auto at = what.find("] "); at != std::string::npos) what = what.substr(at + 2);
     }
-    error = {"$", "not valid JSON: " + what + " (byte " + std::to_string(position) + ")"};
+    // "parse error at line 1, column 4: ..." counts from the line given.
+    constexpr std::string_view kAtLine = "at line ";
+    if (auto at = what.find(kAtLine); at != std::string::npos && line > 1) {
+      const size_t digits = at + kAtLine.size();
+      const size_t end = what.find(',', digits);
+      if (end != std::string::npos) {
+        const size_t inSlice = std::strtoul(what.c_str() + digits, nullptr, 10);
+        what.replace(digits, end - digits, std::to_string(line - 1 + inSlice));
+      }
+    }
+    (void)position;
+    error = {"$", "not valid JSON: " + what};
     return false;
   }
 
@@ -187,14 +207,62 @@ std::string renderJSON(const Value& value) {
   return out;
 }
 
-std::optional<Value> parseJSON(std::string_view text, JSONError* error) {
+namespace {
+
+std::optional<Value> parseJSONLine(std::string_view text, size_t line, JSONError* error) {
   ValueBuilder builder;
+  builder.line = line;
   const bool ok = JSON::sax_parse(text, &builder);
   if (!ok || !builder.root) {
     if (error) *error = builder.error;
     return std::nullopt;
   }
   return std::move(builder.root);
+}
+
+// The number at `path` of `text` as written, when there is one that is not
+// an integer.
+std::optional<std::string> writtenNumber(std::string_view text, const std::string& path) {
+  ValueBuilder builder;
+  builder.wantedPath = path;
+  JSON::sax_parse(text, &builder);
+  if (builder.writtenText.empty()) return std::nullopt;
+  return builder.writtenText;
+}
+
+std::string lineColumn(std::string_view text, size_t offset) {
+  const size_t lineStart = text.rfind('\n', offset == 0 ? 0 : offset - 1);
+  const size_t line =
+      1 + static_cast<size_t>(std::count(text.begin(), text.begin() + offset, '\n'));
+  const size_t column = lineStart == std::string_view::npos ? offset + 1 : offset - lineStart;
+  return "line " + std::to_string(line) + ", column " + std::to_string(column);
+}
+
+struct Line {
+  size_t number;
+  std::string_view text;
+};
+
+// The non-blank lines of `text` when it is JSON Lines: a first line that is a
+// JSON value by itself, and more after it. Empty for any other text.
+std::vector<Line> jsonLines(std::string_view text) {
+  std::vector<Line> lines;
+  size_t number = 1;
+  for (size_t start = 0; start < text.size(); ++number) {
+    size_t end = text.find('\n', start);
+    if (end == std::string_view::npos) end = text.size();
+    std::string_view line = text.substr(start, end - start);
+    if (line.find_first_not_of(" \t\r") != std::string_view::npos) lines.push_back({number, line});
+    start = end + 1;
+  }
+  if (lines.size() < 2 || !JSON::accept(lines.front().text)) return {};
+  return lines;
+}
+
+}  // namespace
+
+std::optional<Value> parseJSON(std::string_view text, JSONError* error) {
+  return parseJSONLine(text, 1, error);
 }
 
 std::optional<std::vector<std::shared_ptr<OTAParamRC>>> modelsFromJSON(std::string_view text,
@@ -204,26 +272,74 @@ std::optional<std::vector<std::shared_ptr<OTAParamRC>>> modelsFromJSON(std::stri
     if (error) *error = {std::move(path), std::move(reason)};
     return std::nullopt;
   };
-  std::optional<Value> value = parseJSON(text, error);
-  if (!value) return std::nullopt;
+  // The parser would end the text at a NUL byte and never look further.
+  if (size_t nul = text.find('\0'); nul != std::string_view::npos)
+    return fail("$", "not valid JSON: a NUL byte at " + lineColumn(text, nul));
 
-  std::vector<std::pair<std::string, const Value*>> objects;
-  if (value->isDictionary()) {
-    objects.emplace_back("$", &*value);
-  } else if (value->isArray() && !single) {
-    const Array& array = *value->asArray();
-    for (size_t i = 0; i < array.size(); ++i)
-      objects.emplace_back("$[" + std::to_string(i) + "]", &array[i]);
+  // The texts of the models with where each one is: the path in the whole
+  // text, or the line and its path.
+  struct Text {
+    std::string where;
+    std::string_view text;
+    std::optional<Value> value;
+  };
+  std::vector<Text> texts;
+  if (std::vector<Line> lines = jsonLines(text); !lines.empty()) {
+    if (single)
+      return fail("$", "expected one object (one OTAParamRC message), got line " +
+                           std::to_string(lines[1].number) + " after it");
+    for (const Line& line : lines) {
+      auto value = parseJSONLine(line.text, line.number, error);
+      if (!value) return std::nullopt;
+      texts.push_back({"line " + std::to_string(line.number) + ": $", line.text, std::move(value)});
+    }
   } else {
-    return fail("$", single ? "expected one object (one OTAParamRC message)"
-                            : "expected an object (one model) or an array of objects");
+    auto value = parseJSON(text, error);
+    if (!value) return std::nullopt;
+    texts.push_back({"$", text, std::move(value)});
   }
 
+  // (where, text, object): the objects to import.
+  struct Object {
+    std::string where;
+    std::string_view text;
+    std::string path;  // of the object within its text
+    const Value* value;
+  };
+  std::vector<Object> objects;
+  for (const Text& t : texts) {
+    if (t.value->isDictionary()) {
+      objects.push_back({t.where, t.text, "$", &*t.value});
+    } else if (t.value->isArray() && !single && texts.size() == 1) {
+      const Array& array = *t.value->asArray();
+      for (size_t i = 0; i < array.size(); ++i) {
+        const std::string path = "$[" + std::to_string(i) + "]";
+        objects.push_back({path, t.text, path, &array[i]});
+      }
+    } else {
+      return fail(t.where, single ? "expected one object (one OTAParamRC message)"
+                           : texts.size() > 1
+                               ? "expected an object (one model) on each line"
+                               : "expected an object (one model), an array of objects or one "
+                                 "object per line");
+    }
+  }
+  if (objects.empty())
+    return fail("$", "holds no model; a model file holds at least one OTAParamRC message");
+
   std::vector<std::shared_ptr<OTAParamRC>> models;
-  for (const auto& [path, object] : objects) {
+  for (const Object& o : objects) {
     DictionaryError why;
-    auto model = OTAParamRC::fromDictionary(*object, &why);
-    if (!model) return fail(below(path, why.path), why.reason);
+    auto model = OTAParamRC::fromDictionary(*o.value, &why);
+    if (!model) {
+      // A number beyond a field's range is shown as it was written.
+      std::string reason = why.reason;
+      if (auto at = reason.find(" is out of range for "); at != std::string::npos) {
+        if (auto written = writtenNumber(o.text, below(o.path, why.path)))
+          reason.replace(0, at, *written);
+      }
+      return fail(below(o.where, why.path), reason);
+    }
     models.push_back(std::move(model));
   }
   return models;

@@ -25,8 +25,9 @@ std::string renderJSON(const Value& value);
 // back as the integer 0), quoted names for NaN and the infinities.
 std::string floatJSON(float value);
 
-// Where in the JSON text a value went wrong: "$" for the whole text, then
-// ".key" and "[index]" down to the value.
+// Where in the JSON text a value went wrong: "$" for the whole text (or
+// "line N: $" for a line of JSON Lines), then ".key" and "[index]" down to the
+// value; a syntax error names its line and column in `reason`.
 struct JSONError {
   std::string path;
   std::string reason;
@@ -41,7 +42,9 @@ struct JSONError {
 std::optional<Value> parseJSON(std::string_view text, JSONError* error);
 
 // The models of a JSON text: an object is one model, an array of objects
-// several. With `single`, only an object is taken.
+// several, and so are JSON Lines, one object a line (what rcmodel decode
+// prints). At least one model; nothing may follow the JSON, not even after a
+// NUL byte. With `single`, only one object is taken.
 std::optional<std::vector<std::shared_ptr<OTAParamRC>>> modelsFromJSON(std::string_view text,
                                                                        bool single,
                                                                        JSONError* error);

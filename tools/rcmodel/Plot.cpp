@@ -376,15 +376,7 @@ std::string drawing(const OTAParamRC& model, const std::string& name) {
          svg.body + "</svg>\n";
 }
 
-}  // namespace
-
-int runPlot(const std::vector<std::string>& args) {
-  Arguments a{"plot"};
-  if (!a.parse(args, {"-o"})) return kExitUsage;
-  if (a.help) {
-    std::fputs(kHelp, stdout);
-    return kExitOK;
-  }
+int run(const Arguments& a) {
   if (a.operands.size() != 1) return usageError(a.command, "give one model file");
   if (!a.output) return usageError(a.command, "give the picture to write with -o OUT.svg");
   const std::string& path = a.operands.front();
@@ -393,5 +385,9 @@ int runPlot(const std::vector<std::string>& args) {
   const std::string name = path == "-" ? "(stdin)" : path.substr(path.rfind('/') + 1);
   return writeOutput(a.command, *a.output, drawing(*model, name)) ? kExitOK : kExitFailed;
 }
+
+}  // namespace
+
+const Command kPlot{"plot", kHelp, kOutputOption, run};
 
 }  // namespace kolvrand::rcmodel

@@ -28,15 +28,7 @@ the daemon would refuse the model (its reasons go to stderr) or OUT cannot be
 written; 2 for a wrong command line.
 )HELP";
 
-}  // namespace
-
-int runRecord(const std::vector<std::string>& args) {
-  Arguments a{"record"};
-  if (!a.parse(args, {"-o"})) return kExitUsage;
-  if (a.help) {
-    std::fputs(kHelp, stdout);
-    return kExitOK;
-  }
+int run(const Arguments& a) {
   if (a.operands.size() != 1) return usageError(a.command, "give one model file");
   const std::string& path = a.operands.front();
 
@@ -64,5 +56,9 @@ int runRecord(const std::vector<std::string>& args) {
   std::fprintf(out, "%s\n", hexString(digest.data(), digest.size()).c_str());
   return kExitOK;
 }
+
+}  // namespace
+
+const Command kRecord{"record", kHelp, kOutputOption, run};
 
 }  // namespace kolvrand::rcmodel

@@ -4,6 +4,7 @@
 #include <algorithm>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <mutex>
 
 #include "daemon/BatteryModelTask.h"
@@ -13,7 +14,6 @@
 #include "pipeline/KextBatteryModel.h"
 #include "platform/CommonCrypto.h"
 #include "platform/Defaults.h"
-#include "platform/FileManager.h"
 #include "tools/rcmodel/Tool.h"
 
 namespace kolvrand::rcmodel {
@@ -79,15 +79,7 @@ std::optional<Data> publishedHash(BatteryModelDataHandler& handler) {
   return *hash->asData();
 }
 
-}  // namespace
-
-int runStatus(const std::vector<std::string>& args) {
-  Arguments a{"status"};
-  if (!a.parse(args, {})) return kExitUsage;
-  if (a.help) {
-    std::fputs(kHelp, stdout);
-    return kExitOK;
-  }
+int run(const Arguments& a) {
   if (!a.operands.empty()) return usageError(a.command, "status takes no file");
 
   auto collect = std::make_shared<Collect>();
@@ -99,11 +91,13 @@ int runStatus(const std::vector<std::string>& args) {
 
   const std::optional<std::string> current = currentBootSessionUUID();
   std::optional<std::string> saved;
-  if (auto defaults = NSUserDefaults::openExistingSuiteNamed(DaemonIdentifier))
+  bool thisSession = false;
+  if (auto defaults = NSUserDefaults::openExistingSuiteNamed(DaemonIdentifier)) {
     saved = defaults->stringForKey("savedBootUUID");
+    thisSession = current && isSavedBootSession(*defaults, *current);
+  }
   line("boot session", current ? *current : "(cannot be read)");
-  line("saved boot session",
-       orNone(saved) + (saved && saved == current ? " (this boot session)" : ""));
+  line("saved boot session", orNone(saved) + (thisSession ? " (this boot session)" : ""));
 
   // A handler without defaults reads the chem ID without storing it.
   auto handler = std::make_shared<BatteryModelDataHandler>();
@@ -116,13 +110,17 @@ int runStatus(const std::vector<std::string>& args) {
   const std::string suffix = handler->getSpecialCaseBatteryModelIdentifier(chemID);
   line("suffix", suffix.empty() ? "(none)" : suffix);
 
+  // The daemon's own first two stages, so that what is said of the file is
+  // what the daemon would say; only a file it takes counts as existing.
   const std::optional<std::string> path = handler->getBatteryModelFilePath(chemID);
-  const bool exists = path && NSFileManager::defaultManager().fileExistsAtPath(*path);
-  line("model file", orNone(path));
-  line("model file exists", exists ? "yes" : "no");
+  const std::optional<std::string> found = handler->getBatteryModelFileURLString(chemID);
   std::shared_ptr<OTAParamRC> model;
-  if (exists) model = handler->loadProtobufModelWithFileName(path);
-  line("model decodes", !exists ? "-" : model ? "yes" : "no");
+  if (found) model = handler->loadProtobufModelWithFileName(found);
+  std::error_code ec;
+  const bool regular = found && std::filesystem::is_regular_file(*found, ec);
+  line("model file", orNone(path));
+  line("model file exists", !found ? "no" : regular ? "yes" : "no, not a regular file");
+  line("model decodes", !regular ? "-" : model ? "yes" : "no");
 
   std::unique_ptr<KextBatteryModel> record;
   if (model) record = handler->createKextModelFromProtobufModel(model.get());
@@ -139,7 +137,7 @@ int runStatus(const std::vector<std::string>& args) {
   const char* verdict = "loaded";
   if (!recordHash)
     verdict = "missing";
-  else if (!saved || !current || saved != current)
+  else if (!thisSession)
     verdict = "stale";
   else if (!published || *published != Data(recordHash->begin(), recordHash->end()))
     verdict = "mismatch";
@@ -158,5 +156,9 @@ int runStatus(const std::vector<std::string>& args) {
   setLogSink(nullptr);
   return kExitOK;
 }
+
+}  // namespace
+
+const Command kStatus{"status", kHelp, 0, run};
 
 }  // namespace kolvrand::rcmodel

@@ -66,13 +66,7 @@ std::vector<uint8_t> copyBytes(const Contents& contents) {
 
 }  // namespace
 
-bool Arguments::parse(const std::vector<std::string>& args,
-                      const std::vector<std::string_view>& allowed) {
-  auto takes = [&](std::string_view option) {
-    for (std::string_view a : allowed)
-      if (a == option) return true;
-    return false;
-  };
+bool Arguments::parse(const std::vector<std::string>& args, unsigned options) {
   bool operandsOnly = false;
   for (size_t i = 0; i < args.size(); ++i) {
     const std::string& a = args[i];
@@ -82,15 +76,15 @@ bool Arguments::parse(const std::vector<std::string>& args,
       operandsOnly = true;
     } else if (a == "-h" || a == "--help") {
       help = true;
-    } else if (a == "--raw" && takes("--raw")) {
+    } else if (a == "--raw" && (options & kRawOption)) {
       raw = true;
-    } else if ((a == "-o" || a == "--output") && takes("-o")) {
+    } else if ((a == "-o" || a == "--output") && (options & kOutputOption)) {
       if (i + 1 == args.size()) {
         usageError(command, a + " needs a file name");
         return false;
       }
       output = args[++i];
-    } else if (a.starts_with("--output=") && takes("-o")) {
+    } else if (a.starts_with("--output=") && (options & kOutputOption)) {
       output = a.substr(9);
     } else {
       usageError(command, "unknown option " + a);
@@ -98,6 +92,16 @@ bool Arguments::parse(const std::vector<std::string>& args,
     }
   }
   return true;
+}
+
+int runCommand(const Command& command, const std::vector<std::string>& args) {
+  Arguments a{std::string(command.name)};
+  if (!a.parse(args, command.options)) return kExitUsage;
+  if (a.help) {
+    std::fputs(command.help, stdout);
+    return kExitOK;
+  }
+  return command.run(a);
 }
 
 void error(const std::string& command, const std::string& message) {
@@ -151,52 +155,6 @@ std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
   return copyBytes(*file);
 }
 
-bool writeOutput(const std::string& command, const std::string& path, std::string_view bytes) {
-  if (path == "-") {
-    if (std::fwrite(bytes.data(), 1, bytes.size(), stdout) != bytes.size() || std::fflush(stdout)) {
-      error(command, "cannot write standard output");
-      return false;
-    }
-    return true;
-  }
-  namespace fs = std::filesystem;
-  const fs::path target(path);
-  fs::path dir = target.parent_path();
-  if (dir.empty()) dir = ".";
-  std::string name = ".";
-  name += target.filename().string();
-  name += ".XXXXXX";
-  std::string temporary = (dir / name).string();
-  int fd = ::mkstemp(temporary.data());
-  if (fd < 0) {
-    error(command, path + ": cannot write: " + std::strerror(errno));
-    return false;
-  }
-  size_t written = 0;
-  int err = 0;
-  while (written < bytes.size()) {
-    ssize_t n = ::write(fd, bytes.data() + written, bytes.size() - written);
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) {
-      err = errno;
-      break;
-    }
-    written += static_cast<size_t>(n);
-  }
-  // mkstemp makes the file private; an output file gets the usual mode.
-  const mode_t mask = ::umask(0);
-  ::umask(mask);
-  if (!err && ::fchmod(fd, 0666 & ~mask) != 0) err = errno;
-  if (::close(fd) != 0 && !err) err = errno;
-  if (!err && ::rename(temporary.c_str(), path.c_str()) != 0) err = errno;
-  if (err) {
-    ::unlink(temporary.c_str());
-    error(command, path + ": cannot write: " + std::strerror(err));
-    return false;
-  }
-  return true;
-}
-
 void routeLogToStderr(const std::string& command) {
   setLogSink(std::make_shared<StderrSink>("rcmodel " + command));
   setLogLevelSpec("error");
@@ -216,7 +174,7 @@ std::shared_ptr<OTAParamRC> readFirstModel(const std::string& command, const std
   }
   if (count) *count = models->size();
   if (models->empty()) {
-    error(command, path + ": holds no message; a model file holds at least one OTAParamRC");
+    error(command, path + ": " + kNoMessage);
     return nullptr;
   }
   return models->front();

@@ -21,6 +21,9 @@ inline constexpr int kExitOK = 0;
 inline constexpr int kExitFailed = 1;
 inline constexpr int kExitUsage = 2;
 
+// The options a command takes besides --help.
+enum Option : unsigned { kRawOption = 1, kOutputOption = 2 };
+
 // The arguments of one command, split into options and operands. "-" is an
 // operand (standard input or output).
 struct Arguments {
@@ -33,10 +36,27 @@ struct Arguments {
   std::optional<std::string> output;  // -o / --output
 
   // Splits `args` (after the command name); false after printing a usage
-  // error when an option is unknown or -o lacks its value. `allowed` lists
-  // the options the command takes besides --help ("--raw", "-o").
-  bool parse(const std::vector<std::string>& args, const std::vector<std::string_view>& allowed);
+  // error when an option is unknown or -o lacks its value.
+  bool parse(const std::vector<std::string>& args, unsigned options);
 };
+
+// One command: its --help text, the options it takes, and what it does with
+// arguments that parsed (--help is answered before).
+struct Command {
+  std::string_view name;
+  const char* help;
+  unsigned options;
+  int (*run)(const Arguments&);
+};
+
+extern const Command kDecode, kEncode, kRecord, kValidate, kPlot, kStatus;
+
+// Parses `args` for `command` and runs it: the exit code.
+int runCommand(const Command& command, const std::vector<std::string>& args);
+
+// Why a file without messages is no model file, for every command that meets one.
+inline constexpr const char* kNoMessage =
+    "holds no message; a model file holds at least one OTAParamRC message";
 
 // Prints "rcmodel COMMAND: MESSAGE" on stderr, one line.
 void error(const std::string& command, const std::string& message);
@@ -49,8 +69,9 @@ int usageError(const std::string& command, const std::string& message);
 std::optional<std::vector<uint8_t>> readInput(const std::string& command, const std::string& path);
 std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
                                                    const std::string& path);
-// Writes `bytes` to FILE (through a temporary file renamed into place, so a
-// failed write leaves nothing behind) or to standard output for "-".
+// Writes `bytes` to standard output for "-", else to PATH: a regular file (or
+// the one a symlink ends at) is replaced whole or not at all; a FIFO or a
+// device is written in place. false after a one-line message.
 bool writeOutput(const std::string& command, const std::string& path, std::string_view bytes);
 
 // Routes the platform log to stderr as "rcmodel COMMAND: MESSAGE" lines, with
@@ -62,13 +83,5 @@ void routeLogToStderr(const std::string& command);
 std::shared_ptr<OTAParamRC> readFirstModel(const std::string& command, const std::string& path,
                                            size_t* count = nullptr);
 
-// The commands; each takes the arguments after its name and returns the exit
-// code.
-int runDecode(const std::vector<std::string>& args);
-int runEncode(const std::vector<std::string>& args);
-int runRecord(const std::vector<std::string>& args);
-int runValidate(const std::vector<std::string>& args);
-int runPlot(const std::vector<std::string>& args);
-int runStatus(const std::vector<std::string>& args);
 
 }  // namespace kolvrand::rcmodel

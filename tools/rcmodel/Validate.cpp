@@ -46,18 +46,13 @@ bool validate(const std::string& path) {
               count > 1 ? "; the daemon uses the first" : "");
 
   std::printf("  %-40s %6s %6s\n", "list", "held", "record");
-  for (const KextTableSource& t : kextTableSources()) {
-    const OTAResistanceData* table = t.table(*model);
-    if (!table) {
-      std::printf("  %-40s %6s %6s  MISSING: the record needs all %zu resistance tables\n", t.field,
+  for (const KextListCheck& c : checkKextLists(*model)) {
+    if (!c.list)
+      std::printf("  %-40s %6s %6s  MISSING: the record needs all %zu resistance tables\n", c.table,
                   "-", "-", kextTableSources().size());
-      continue;
-    }
-    for (const KextTableListSource& l : kextTableListSources())
-      row(std::string(t.field) + "." + l.field, l.elements(*table).size(), l.count);
+    else
+      row(c.name(), c.held, c.carried);
   }
-  for (const KextListSource& l : kextListSources())
-    row(l.field, l.elements(*model).size(), l.count);
 
   // What the record carries for values the model may leave out.
   if (!model->hasBmuResistance())
@@ -83,15 +78,7 @@ bool validate(const std::string& path) {
   return true;
 }
 
-}  // namespace
-
-int runValidate(const std::vector<std::string>& args) {
-  Arguments a{"validate"};
-  if (!a.parse(args, {})) return kExitUsage;
-  if (a.help) {
-    std::fputs(kHelp, stdout);
-    return kExitOK;
-  }
+int run(const Arguments& a) {
   if (a.operands.empty()) return usageError(a.command, "give at least one model file");
   bool all = true;
   for (size_t i = 0; i < a.operands.size(); ++i) {
@@ -102,5 +89,9 @@ int runValidate(const std::vector<std::string>& args) {
   }
   return all ? kExitOK : kExitFailed;
 }
+
+}  // namespace
+
+const Command kValidate{"validate", kHelp, 0, run};
 
 }  // namespace kolvrand::rcmodel

@@ -33,15 +33,9 @@ Environment: KOLVRAND_DEVICE=DIR makes status look at the simulated device in DI
 instead of this host.
 )HELP";
 
-struct Command {
-  std::string_view name;
-  int (*run)(const std::vector<std::string>&);
-};
-
-constexpr Command kCommands[] = {
-    {"decode", kolvrand::rcmodel::runDecode}, {"encode", kolvrand::rcmodel::runEncode},
-    {"record", kolvrand::rcmodel::runRecord}, {"validate", kolvrand::rcmodel::runValidate},
-    {"plot", kolvrand::rcmodel::runPlot},     {"status", kolvrand::rcmodel::runStatus},
+constexpr const kolvrand::rcmodel::Command* kCommands[] = {
+    &kolvrand::rcmodel::kDecode,   &kolvrand::rcmodel::kEncode, &kolvrand::rcmodel::kRecord,
+    &kolvrand::rcmodel::kValidate, &kolvrand::rcmodel::kPlot,   &kolvrand::rcmodel::kStatus,
 };
 
 }  // namespace
@@ -57,8 +51,8 @@ int main(int argc, char** argv) {
     std::fputs(kUsage, stdout);
     return kolvrand::rcmodel::kExitOK;
   }
-  for (const Command& command : kCommands)
-    if (name == command.name) return command.run({args.begin() + 1, args.end()});
+  for (const kolvrand::rcmodel::Command* command : kCommands)
+    if (name == command->name) return runCommand(*command, {args.begin() + 1, args.end()});
   std::fprintf(stderr, "rcmodel: unknown command \"%s\"; run rcmodel --help for the commands\n",
                name.c_str());
   return kolvrand::rcmodel::kExitUsage;

@@ -1,0 +1,129 @@
+// Writing a command's output file. A regular file is replaced whole, through a
+// temporary file renamed over it, so a failed write leaves the old content;
+// a symlink is written through, the file it ends at replaced beside itself;
+// anything else (a FIFO, a terminal, /dev/null) is written in place, since
+// renaming over it would take it from its readers.
+#include <fcntl.h>
+#include <limits.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <optional>
+
+#include "tools/rcmodel/Tool.h"
+
+namespace kolvrand::rcmodel {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+bool writeAll(int fd, std::string_view bytes) {
+  while (!bytes.empty()) {
+    ssize_t n = ::write(fd, bytes.data(), bytes.size());
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) return false;
+    bytes.remove_prefix(static_cast<size_t>(n));
+  }
+  return true;
+}
+
+// The path a chain of symlinks starting at `path` ends at, which need not
+// exist (a dangling link is written through as a shell's ">" does); 0, or an
+// errno value in *err.
+fs::path finalTarget(fs::path path, int* err) {
+  for (int hops = 0; hops < 40; ++hops) {
+    struct stat st {};
+    if (::lstat(path.c_str(), &st) != 0 || !S_ISLNK(st.st_mode)) return path;
+    char link[PATH_MAX];
+    ssize_t n = ::readlink(path.c_str(), link, sizeof link);
+    if (n < 0 || static_cast<size_t>(n) == sizeof link) {
+      *err = n < 0 ? errno : ENAMETOOLONG;
+      return path;
+    }
+    const fs::path next(std::string(link, static_cast<size_t>(n)));
+    path = next.is_absolute() ? next : path.parent_path() / next;
+  }
+  *err = ELOOP;
+  return path;
+}
+
+// Replaces `target` with a file holding `bytes`, keeping the mode (and, for
+// root, the owner) of the file it replaces; 0 or an errno value.
+int replaceFile(const fs::path& target, std::string_view bytes) {
+  fs::path dir = target.parent_path();
+  if (dir.empty()) dir = ".";
+  std::string temporary = (dir / ("." + target.filename().string() + ".XXXXXX")).string();
+  const int fd = ::mkstemp(temporary.data());
+  if (fd < 0) return errno;
+
+  int err = 0;
+  struct stat old {};
+  if (::stat(target.c_str(), &old) == 0) {
+    if (::fchmod(fd, old.st_mode & 07777) != 0) err = errno;
+    if (!err && ::geteuid() == 0 && ::fchown(fd, old.st_uid, old.st_gid) != 0) err = errno;
+  } else {
+    // mkstemp makes the file private; a new output file gets the usual mode.
+    const mode_t mask = ::umask(0);
+    ::umask(mask);
+    if (::fchmod(fd, 0666 & ~mask) != 0) err = errno;
+  }
+  if (!err && !writeAll(fd, bytes)) err = errno;
+  if (!err && ::fsync(fd) != 0) err = errno;
+  if (::close(fd) != 0 && !err) err = errno;
+  if (!err && ::rename(temporary.c_str(), target.c_str()) != 0) err = errno;
+  if (err) ::unlink(temporary.c_str());
+  return err;
+}
+
+// Writes into what is already at `path`, without creating or truncating.
+int writeInPlace(const std::string& path, std::string_view bytes) {
+  const int fd = ::open(path.c_str(), O_WRONLY | O_NOCTTY | O_CLOEXEC);
+  if (fd < 0) return errno;
+  int err = writeAll(fd, bytes) ? 0 : errno;
+  if (::close(fd) != 0 && !err) err = errno;
+  return err;
+}
+
+}  // namespace
+
+bool writeOutput(const std::string& command, const std::string& path, std::string_view bytes) {
+  if (path == "-") {
+    if (std::fwrite(bytes.data(), 1, bytes.size(), stdout) != bytes.size() || std::fflush(stdout)) {
+      error(command, "cannot write standard output");
+      return false;
+    }
+    return true;
+  }
+  struct stat st {};
+  const bool exists = ::stat(path.c_str(), &st) == 0;
+  if (!exists && errno != ENOENT) {
+    error(command, path + ": cannot write: " + std::strerror(errno));
+    return false;
+  }
+  if (exists && S_ISDIR(st.st_mode)) {
+    error(command, path + ": is a directory; give a file to write");
+    return false;
+  }
+  if (exists && !S_ISREG(st.st_mode)) {
+    if (int err = writeInPlace(path, bytes)) {
+      error(command, path + ": cannot write: " + std::strerror(err));
+      return false;
+    }
+    return true;
+  }
+  int err = 0;
+  const fs::path target = finalTarget(path, &err);
+  if (!err) err = replaceFile(target, bytes);
+  if (err) {
+    error(command, path + ": cannot write: " + std::strerror(err) + "; it was left as it was");
+    return false;
+  }
+  return true;
+}
+
+}  // namespace kolvrand::rcmodel
