@@ -26,25 +26,20 @@ std::filesystem::path deviceDir;
 
 extern "C" int LLVMFuzzerInitialize(int*, char***) {
   fuzz::quietLogs();
-  // Memory-backed where possible: every input is written as a file.
-  std::string pattern =
-      (std::filesystem::exists("/dev/shm") ? "/dev/shm" : "/tmp") + std::string("/kvr-fuzz.XXXXXX");
-  check(mkdtemp(pattern.data()) != nullptr);
+  // Memory-backed: every input is written as a file.
+  std::string pattern = "/dev/shm/kvr-fuzz.XXXXXX";
+  if (!mkdtemp(pattern.data())) {
+    pattern = "/tmp/kvr-fuzz.XXXXXX";
+    check(mkdtemp(pattern.data()) != nullptr);
+  }
   deviceDir = pattern;
-  std::atexit([] {
-    std::error_code ec;
-    std::filesystem::remove_all(deviceDir, ec);
-  });
+  std::atexit([] { std::filesystem::remove_all(deviceDir); });
   return 0;
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  {
-    FILE* f = std::fopen((deviceDir / "device.json").c_str(), "wb");
-    check(f != nullptr);
-    check(std::fwrite(data, 1, size, f) == size);
-    std::fclose(f);
-  }
+  FILE* f = std::fopen((deviceDir / "device.json").c_str(), "wb");
+  check(f && std::fwrite(data, 1, size, f) == size && std::fclose(f) == 0);
   auto device = makeSimulatedDevice(deviceDir);
   check(device != nullptr);
   for (const char* name : {"kern.bootsessionuuid", "hw.targettype", ""}) {

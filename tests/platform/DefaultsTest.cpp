@@ -9,36 +9,28 @@ namespace kolvrand {
 namespace {
 
 using test::readFileText;
-using test::TempDir;
 using test::writeFile;
 
 constexpr const char* kSuite = "com.tesvar.kolvrand";
 
 TEST(Defaults, ReadsEachTypeOnlyAsItselfAndSeesWritesMadeElsewhere) {
-  TempDir dir;
+  test::TempDir dir;
   auto d = NSUserDefaults::initWithSuiteName(kSuite, dir.path());
   auto same = NSUserDefaults::initWithSuiteName(kSuite, dir.path() / "." / "");
   ASSERT_TRUE(d && same);
-  EXPECT_EQ(d->path(), dir.path() / "com.tesvar.kolvrand.json");
-  ASSERT_TRUE(d->setObject("C5B4-11", "s"));
-  ASSERT_TRUE(d->setInteger(INT64_MIN, "min"));
-  ASSERT_TRUE(d->setBool(true, "b"));
+  ASSERT_TRUE(d->setObject("C5B4-11", "s") && d->setInteger(INT64_MIN, "min") &&
+              d->setBool(true, "b"));
   writeFile(dir.path() / "other.json", R"({"big": 18446744073709551615, "f": 1.5, "n": null})");
   auto other = NSUserDefaults::initWithSuiteName("other", dir.path());
-
-  const struct {
-    const NSUserDefaults& defaults;
-    const char* key;
-    std::optional<std::string> string;
-    bool boolean;
-  } cases[] = {{*same, "s", "C5B4-11", false},       {*same, "min", std::nullopt, false},
-               {*same, "b", std::nullopt, true},     {*d, "absent", std::nullopt, false},
-               {*other, "big", std::nullopt, false}, {*other, "n", std::nullopt, false}};
-  for (const auto& c : cases) {
-    EXPECT_EQ(c.defaults.stringForKey(c.key), c.string) << c.key;
-    EXPECT_EQ(c.defaults.boolForKey(c.key), c.boolean) << c.key;
+  const std::tuple<const NSUserDefaults&, const char*, std::optional<std::string>, bool> cases[] = {
+      {*same, "s", "C5B4-11", false},       {*same, "min", std::nullopt, false},
+      {*same, "b", std::nullopt, true},     {*d, "absent", std::nullopt, false},
+      {*other, "big", std::nullopt, false}, {*other, "n", std::nullopt, false}};
+  for (const auto& [defaults, key, string, boolean] : cases) {
+    EXPECT_EQ(defaults.stringForKey(key), string) << key;
+    EXPECT_EQ(defaults.boolForKey(key), boolean) << key;
   }
-  EXPECT_EQ(nlohmann::json::parse(readFileText(d->path())),
+  EXPECT_EQ(nlohmann::json::parse(readFileText(dir.path() / "com.tesvar.kolvrand.json")),
             nlohmann::json({{"s", "C5B4-11"}, {"min", INT64_MIN}, {"b", true}}));
   // Another process replacing the file is seen at the next read.
   writeFile(d->path(), R"({"s": "two"})");
@@ -46,30 +38,26 @@ TEST(Defaults, ReadsEachTypeOnlyAsItselfAndSeesWritesMadeElsewhere) {
 }
 
 TEST(Defaults, FailsOnlyWhenTheDirectoryCannotBeMadeOrTheNameIsNoFileName) {
-  TempDir dir;
+  test::TempDir dir;
   writeFile(dir.path() / "file", "");
   EXPECT_FALSE(NSUserDefaults::initWithSuiteName(kSuite, dir.path() / "file" / "state"));
   EXPECT_FALSE(NSUserDefaults::initWithSuiteName("", dir.path()));
   EXPECT_FALSE(NSUserDefaults::initWithSuiteName("a/b", dir.path()));
   // A missing directory, nested too, is created.
   auto d = NSUserDefaults::initWithSuiteName(kSuite, dir.path() / "a" / "b");
-  ASSERT_TRUE(d);
-  EXPECT_TRUE(d->setInteger(1, "k"));
-}
+  EXPECT_TRUE(d && d->setInteger(1, "k"));
 
-// For tools that look at the daemon's state without changing it.
-TEST(Defaults, AnExistingSuiteOpensForReadingOnlyAndNothingIsCreated) {
-  TempDir dir;
+  // For tools that look at the daemon's state without changing it: an
+  // existing suite opens for reading only, and nothing is created.
   EXPECT_FALSE(NSUserDefaults::openExistingSuiteNamed(kSuite, dir.path() / "state"));
   EXPECT_FALSE(NSUserDefaults::openExistingSuiteNamed(kSuite, dir.path()));
   EXPECT_FALSE(std::filesystem::exists(dir.path() / "state"));
-
-  writeFile(dir.path() / "com.tesvar.kolvrand.json", R"({"savedBootUUID": "u"})");
-  auto d = NSUserDefaults::openExistingSuiteNamed(kSuite, dir.path());
-  ASSERT_TRUE(d);
-  EXPECT_EQ(d->stringForKey("savedBootUUID"), "u");
-  EXPECT_FALSE(d->setObject("v", "savedBootUUID"));
-  EXPECT_EQ(readFileText(d->path()), R"({"savedBootUUID": "u"})");
+  writeFile(dir.path() / "com.tesvar.kolvrand.json", R"({"k": "u"})");
+  auto existing = NSUserDefaults::openExistingSuiteNamed(kSuite, dir.path());
+  ASSERT_TRUE(existing);
+  EXPECT_EQ(existing->stringForKey("k"), "u");
+  EXPECT_FALSE(existing->setObject("v", "k"));
+  EXPECT_EQ(readFileText(existing->path()), R"({"k": "u"})");
   EXPECT_FALSE(std::filesystem::exists(dir.path() / "com.tesvar.kolvrand.json.lock"));
 }
 

@@ -1,4 +1,5 @@
-// Runs dispatch_main in a scenario named by argv[1] and reports on stdout:
+// Runs dispatch_main in a scenario named by argv[1] and reports on stdout,
+// after its pid:
 //   activity  one activity; prints "state N" at every call of its handler
 //   stop      a slow block ("started", then "finished") and one queued after it
 #include <unistd.h>
@@ -23,6 +24,7 @@ void say(std::string line) {
 int main(int argc, char** argv) {
   using namespace kolvrand;
   std::string scenario = argc > 1 ? argv[1] : "";
+  say(std::to_string(::getpid()));
   auto queue = dispatch_queue_create("child", DISPATCH_QUEUE_SERIAL);
   if (scenario == "activity") {
     xpc_activity_register("com.tesvar.kolvrand.test", XPC_ACTIVITY_CHECK_IN, [](xpc_activity_t a) {

@@ -23,21 +23,18 @@ namespace kolvrand {
 namespace {
 
 namespace fs = std::filesystem;
-using Lines = std::vector<std::string>;
 
-size_t count(const Lines& lines, const std::string& line) {
-  return static_cast<size_t>(std::count(lines.begin(), lines.end(), line));
+nlohmann::json finalState(const std::string& bootUUID) {
+  return {{"savedBootUUID", bootUUID}, {"savedChemID", 8552}, {"updateConditionMet", false}};
 }
 
 TEST(Concurrency, ActivityHandlerBesideTheBatteryModelTask) {
   constexpr int kRounds = 12, kRunsPerRound = 4;
   test::TestDevice device;
-  {
-    std::ifstream in(fs::path(KOLVRAND_SOURCE_DIR) /
-                         "examples/device/Library/KVR/BatteryModels/T618e/2168.rcmodel",
-                     std::ios::binary);
-    device.installModel("T618e/2168.rcmodel", {std::istreambuf_iterator<char>(in), {}});
-  }
+  std::ifstream in(fs::path(KOLVRAND_SOURCE_DIR) /
+                       "examples/device/Library/KVR/BatteryModels/T618e/2168.rcmodel",
+                   std::ios::binary);
+  device.installModel("T618e/2168.rcmodel", {std::istreambuf_iterator<char>(in), {}});
   const os_log_t mainLog = os_log_create(DaemonIdentifier, "main");
   auto handler = BatteryModelDataHandler::init();
   auto agent = ConditionCheckingAgent::init();
@@ -48,27 +45,24 @@ TEST(Concurrency, ActivityHandlerBesideTheBatteryModelTask) {
     // A new boot session each round, so every task uploads and writes.
     ASSERT_TRUE(defaults->setObject("", "savedBootUUID"));
     std::thread task([&] { runBatteryModelTask(mainLog, handler.get()); });
-    std::thread activity([&] {
-      for (int i = 0; i < kRunsPerRound; ++i) {
-        XPCActivity run{"com.tesvar.kolvrand.batteryAgingUpdate", XPC_ACTIVITY_STATE_RUN};
-        batteryAgingActivityHandler(&run, mainLog, agent.get());
-      }
-    });
+    for (int i = 0; i < kRunsPerRound; ++i) {
+      XPCActivity run{"com.tesvar.kolvrand.batteryAgingUpdate", XPC_ACTIVITY_STATE_RUN};
+      batteryAgingActivityHandler(&run, mainLog, agent.get());
+    }
     task.join();
-    activity.join();
   }
 
-  const Lines lines = device.logLines();
-  EXPECT_EQ(count(lines, "default [main] Battery data upload succeeded"), size_t{kRounds});
-  EXPECT_EQ(count(lines, "debug [main] battery aging compensation has finished successfully"),
-            size_t{kRounds * kRunsPerRound});
+  const auto lines = device.logLines();
+  const auto count = [&](const std::string& line) {
+    return static_cast<int>(std::count(lines.begin(), lines.end(), line));
+  };
+  EXPECT_EQ(count("default [main] Battery data upload succeeded"), kRounds);
+  EXPECT_EQ(count("debug [main] battery aging compensation has finished successfully"),
+            kRounds * kRunsPerRound);
   EXPECT_TRUE(std::none_of(lines.begin(), lines.end(), [](const std::string& l) {
     return l.starts_with("error");
   })) << testing::PrintToString(lines);
-  EXPECT_EQ(device.state(),
-            (nlohmann::json{{"savedBootUUID", "11111111-2222-3333-4444-555555555555"},
-                            {"savedChemID", 8552},
-                            {"updateConditionMet", false}}));
+  EXPECT_EQ(device.state(), finalState("11111111-2222-3333-4444-555555555555"));
 }
 
 // The real daemon, asked for the activity again and again while its task
@@ -95,9 +89,7 @@ TEST(Concurrency, DaemonRunsActivitiesDuringTheUpload) {
   }
   std::ifstream in(dir / "state/com.tesvar.kolvrand.json");
   EXPECT_EQ(nlohmann::json::parse(in, nullptr, false),
-            (nlohmann::json{{"savedBootUUID", "6f1c2b7e-3d4a-4e5f-9a1b-2c3d4e5f6a7b"},
-                            {"savedChemID", 8552},
-                            {"updateConditionMet", false}}));
+            finalState("6f1c2b7e-3d4a-4e5f-9a1b-2c3d4e5f6a7b"));
   fs::remove_all(dir);
 }
 
@@ -110,14 +102,11 @@ TEST(Concurrency, WritersOfOneSuiteLoseNothing) {
   const std::string suite = "com.tesvar.kolvrand";
   auto writer = [&](const std::string& key) {
     auto d = NSUserDefaults::initWithSuiteName(suite, dir);
-    if (!d) return false;
-    for (int n = 1; n <= kWrites; ++n) {
-      const std::string value = std::to_string(n);
-      if (!d->setObject(value, key) || d->stringForKey(key) != value) return false;
-    }
+    for (int n = 1; n <= kWrites; ++n)
+      if (!d || !d->setObject(std::to_string(n), key) || d->stringForKey(key) != std::to_string(n))
+        return false;
     return true;
   };
-
   // The processes first, while this one has a single thread to fork.
   std::vector<pid_t> children;
   for (int p = 0; p < kProcesses; ++p) {
@@ -137,12 +126,10 @@ TEST(Concurrency, WritersOfOneSuiteLoseNothing) {
     EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
   }
   EXPECT_EQ(std::count(ok.begin(), ok.end(), 1), kThreads);
-
   auto d = NSUserDefaults::initWithSuiteName(suite, dir);
-  for (int p = 0; p < kProcesses; ++p)
-    EXPECT_EQ(d->stringForKey("process" + std::to_string(p)), std::to_string(kWrites));
-  for (int t = 0; t < kThreads; ++t)
-    EXPECT_EQ(d->stringForKey("thread" + std::to_string(t)), std::to_string(kWrites));
+  for (const char* who : {"process", "thread"})
+    for (int i = 0; i < (who[0] == 'p' ? kProcesses : kThreads); ++i)
+      EXPECT_EQ(d->stringForKey(who + std::to_string(i)), std::to_string(kWrites));
   fs::remove_all(dir);
 }
 

@@ -8,18 +8,13 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <cstring>
 #include <fstream>
 #include <functional>
 #include <nlohmann/json.hpp>
 
-#include "model/OTAParamRC.h"
-#include "pipeline/BatteryModelDataHandler.h"
-#include "pipeline/KextBatteryModel.h"
 #include "pipeline/PBStreamReader.h"
-#include "platform/ValueJSON.h"
+#include "tests/platform/TestUtil.h"
 #include "tests/support/DaemonProcess.h"
-#include "tests/support/ModelFiles.h"
 
 namespace kolvrand {
 namespace {
@@ -37,14 +32,8 @@ const std::string kFailed = "error [main] Battery data upload failed";
 const std::string kSucceeded = "default [main] Battery data upload succeeded";
 const std::string kNoBootUUID = "error [main] Unable to get current boot UUID";
 
-std::string readAll(const fs::path& path) {
-  std::ifstream in(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(in), {}};
-}
-
-void writeAll(const fs::path& path, const std::string& bytes) {
-  std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
-}
+using test::readFileText;
+using test::writeFile;
 
 // A copy of examples/device whose settings already hold a value of the
 // aging activity's and a boot session of earlier, for the test to check that
@@ -58,7 +47,7 @@ class Device {
     std::ifstream in(dir_ / "device.json");
     json_ = json::parse(in);
     fs::create_directories(dir_ / "state");
-    writeAll(dir_ / kState, kEarlierState.dump(2));
+    writeFile(dir_ / kState, kEarlierState.dump(2));
   }
   ~Device() {
     std::error_code ec;
@@ -67,7 +56,7 @@ class Device {
   const fs::path& dir() const { return dir_; }
   fs::path path(const char* relative) const { return dir_ / relative; }
   json& deviceJSON() { return json_; }
-  void save() const { writeAll(dir_ / "device.json", json_.dump(2)); }
+  void save() const { writeFile(dir_ / "device.json", json_.dump(2)); }
   std::string bootUUID() const { return json_["sysctl"]["kern.bootsessionuuid"]; }
 
   static inline const json kEarlierState = {
@@ -85,15 +74,19 @@ enum class Outcome { Uploaded, Unverified, Failed, NoBootSession };
 // Runs the daemon on `device` until the battery-model task has ended, then
 // runs the aging activity once and stops it. Checks what every case must
 // hold and returns the log lines.
-Lines runDaemon(Device& device, Outcome outcome, std::vector<std::string> launcher = {}) {
+Lines runDaemon(Device& device, Outcome outcome, std::vector<std::string> launcher = {},
+                long* peakKiB = nullptr) {
   test::DaemonProcess daemon(device.dir(), "debug", std::move(launcher));
   EXPECT_TRUE(daemon.running());
   const std::string last = outcome == Outcome::Uploaded        ? kSucceeded
                            : outcome == Outcome::NoBootSession ? kNoBootUUID
                                                                : kFailed;
   const std::string lastText = last.substr(last.find("] ") + 2);
-  EXPECT_TRUE(daemon.waitForLine({lastText}, std::chrono::seconds(60))) << daemon.rawStderr();
+  EXPECT_TRUE(daemon.waitForLine({lastText}, std::chrono::seconds(120))) << daemon.rawStderr();
   EXPECT_TRUE(daemon.waitForLine({"checking in"})) << daemon.rawStderr();
+  std::ifstream status("/proc/" + std::to_string(daemon.pid()) + "/status");
+  for (std::string line; peakKiB && std::getline(status, line);)
+    if (line.starts_with("VmHWM:")) *peakKiB = std::stol(line.substr(6));
   // Still serving: the activity runs on demand.
   daemon.signal(SIGUSR1);
   EXPECT_TRUE(daemon.waitForLine({"compensation has finished successfully"})) << daemon.rawStderr();
@@ -107,8 +100,8 @@ Lines runDaemon(Device& device, Outcome outcome, std::vector<std::string> launch
 
   // The settings parse and hold the earlier values, or the new boot session
   // after an upload; nothing else changed.
-  json state = json::parse(readAll(device.path(kState)), nullptr, false);
-  EXPECT_TRUE(state.is_object()) << readAll(device.path(kState));
+  json state = json::parse(readFileText(device.path(kState)), nullptr, false);
+  EXPECT_TRUE(state.is_object()) << readFileText(device.path(kState));
   json expected = Device::kEarlierState;
   if (outcome == Outcome::Uploaded) expected["savedBootUUID"] = device.bootUUID();
   if (state.is_object() && outcome != Outcome::NoBootSession)
@@ -124,112 +117,95 @@ bool contains(const Lines& lines, const std::string& text) {
                      [&](const std::string& l) { return l.find(text) != std::string::npos; });
 }
 
-std::string delimited(const std::string& message) {
-  std::string out;
-  uint64_t n = message.size();
-  do {
-    const auto b = static_cast<uint8_t>(n & 0x7f);
-    n >>= 7;
-    out += static_cast<char>(n ? b | 0x80 : b);
-  } while (n);
-  return out + message;
-}
-
-// Groups of an unknown field (1000) opened `depth` times and closed again,
-// inside an otherwise empty model.
+// A model of groups of an unknown field (1000) opened `depth` times and
+// closed again, and nothing else.
 std::string nestedGroups(size_t depth) {
-  std::string open = "\xc3\x3e", close = "\xc4\x3e";
   std::string body;
-  for (size_t i = 0; i < depth; ++i) body += open;
-  for (size_t i = 0; i < depth; ++i) body += close;
-  return delimited(body);
+  for (size_t i = 0; i < depth; ++i) body += "\xc3\x3e";
+  for (size_t i = 0; i < depth; ++i) body += "\xc4\x3e";
+  std::string out;
+  for (uint64_t n = body.size(); n; n >>= 7) out += static_cast<char>(n > 0x7f ? n | 0x80 : n);
+  return out + body;
 }
 
-struct ModelCase {
+struct Case {
   const char* name;
-  // Puts the hostile thing at the model's path.
-  std::function<void(const fs::path&)> arrange;
+  std::function<void(Device&)> arrange;
+  Outcome outcome;
   std::string line;  // a line of the failure chain, or part of one
 };
 
-TEST(HostileModelFile, IsRefusedWithAReasonAndNothingIsUploaded) {
-  const std::string example = readAll(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device" / kModel);
-  const ModelCase cases[] = {
-      {"a directory", [](const fs::path& p) { fs::create_directory(p); }, "not a regular file"},
-      {"a FIFO", [](const fs::path& p) { mkfifo(p.c_str(), 0600); }, "not a regular file"},
-      {"a symlink loop", [](const fs::path& p) { fs::create_symlink(p.filename(), p); },
-       "getBatteryModelFileURLString:] <Error> file not present: "},
-      {"a symlink to a dangling symlink",
-       [](const fs::path& p) {
-         fs::create_symlink("missing", p.parent_path() / "dangling");
-         fs::create_symlink("dangling", p);
-       },
-       "getBatteryModelFileURLString:] <Error> file not present: "},
-      {"empty", [](const fs::path& p) { writeAll(p, ""); }, kLoad + "protobufModelRCParams nil"},
-      {"one byte over the cap",
-       [](const fs::path& p) {
-         std::ofstream big(p, std::ios::binary);
-         big.seekp(PBStreamReader::kMaxFileSize);
-         big.put('\0');
-       },
-       "4194305 bytes is larger than the 4194304-byte limit for a model file"},
-      {"a length prefix of 2^63",
-       [](const fs::path& p) {
-         writeAll(p, std::string("\x80\x80\x80\x80\x80\x80\x80\x80\x80\x01", 10));
-       },
-       "message 0 at offset 0 claims 9223372036854775808 bytes but only 0 remain in the file"},
-      {"cut short", [&](const fs::path& p) { writeAll(p, example.substr(0, example.size() / 2)); },
-       "message 0 at offset 0 claims "},
-      {"groups nested 100000 deep", [](const fs::path& p) { writeAll(p, nestedGroups(100000)); },
-       "message 0 at offset 0 could not be decoded"},
-      {"the example with its bytes reversed",
-       [&](const fs::path& p) { writeAll(p, std::string(example.rbegin(), example.rend())); },
-       kLoad + "readContent error is "},
-  };
-  for (const ModelCase& c : cases) {
+void runCases(const std::vector<Case>& cases) {
+  for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     Device device;
-    fs::remove(device.path(kModel));
-    c.arrange(device.path(kModel));
-    Lines lines = runDaemon(device, Outcome::Failed);
+    c.arrange(device);
+    Lines lines = runDaemon(device, c.outcome);
     EXPECT_TRUE(contains(lines, c.line)) << testing::PrintToString(lines);
-    // The reader refused before anything reached the record builder.
-    EXPECT_FALSE(contains(lines, "createKextModelFromProtobufModel"))
-        << testing::PrintToString(lines);
+    // A refusal before the model was read whole reaches no record builder.
+    if (c.outcome == Outcome::Failed && !c.line.starts_with("createKext")) {
+      EXPECT_FALSE(contains(lines, "createKextModelFromProtobufModel"))
+          << testing::PrintToString(lines);
+    }
   }
 }
 
-TEST(HostileModelFile, GroupsNestedAsDeepAsAllowedStillRead) {
-  Device device;
-  writeAll(device.path(kModel), nestedGroups(64));
-  Lines lines = runDaemon(device, Outcome::Failed);
-  // Read, then refused only because an empty model cannot fill the record.
-  EXPECT_TRUE(contains(lines, "createKextModelFromProtobufModel:] <Error> R0 nil"))
-      << testing::PrintToString(lines);
+TEST(HostileModelFile, IsRefusedWithAReasonAndNothingIsUploaded) {
+  const std::string example =
+      readFileText(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device" / kModel);
+  const auto put = [](std::function<void(const fs::path&)> make) {
+    return [make](Device& d) {
+      fs::remove(d.path(kModel));
+      make(d.path(kModel));
+    };
+  };
+  const auto bytes = [&](std::string b) {
+    return put([b](const fs::path& p) { writeFile(p, b); });
+  };
+  const std::string notPresent = "getBatteryModelFileURLString:] <Error> file not present: ";
+  runCases({
+      {"a directory", put([](const fs::path& p) { fs::create_directory(p); }), Outcome::Failed,
+       "not a regular file"},
+      {"a FIFO", put([](const fs::path& p) { mkfifo(p.c_str(), 0600); }), Outcome::Failed,
+       "not a regular file"},
+      {"a symlink loop", put([](const fs::path& p) { fs::create_symlink(p.filename(), p); }),
+       Outcome::Failed, notPresent},
+      {"a symlink to a dangling symlink", put([](const fs::path& p) {
+         fs::create_symlink("missing", p.parent_path() / "dangling");
+         fs::create_symlink("dangling", p);
+       }),
+       Outcome::Failed, notPresent},
+      {"empty", bytes(""), Outcome::Failed, kLoad + "protobufModelRCParams nil"},
+      {"one byte over the cap", bytes(std::string(PBStreamReader::kMaxFileSize + 1, '\0')),
+       Outcome::Failed, "4194305 bytes is larger than the 4194304-byte limit for a model file"},
+      {"a length prefix of 2^63",
+       bytes(std::string("\x80\x80\x80\x80\x80\x80\x80\x80\x80\x01", 10)), Outcome::Failed,
+       "message 0 at offset 0 claims 9223372036854775808 bytes but only 0 remain in the file"},
+      {"cut short", bytes(example.substr(0, example.size() / 2)), Outcome::Failed,
+       "message 0 at offset 0 claims "},
+      {"groups nested 100000 deep", bytes(nestedGroups(100000)), Outcome::Failed,
+       "message 0 at offset 0 could not be decoded"},
+      {"the example with its bytes reversed", bytes(std::string(example.rbegin(), example.rend())),
+       Outcome::Failed, kLoad + "readContent error is "},
+      // Read, then refused only because an empty model cannot fill the record.
+      {"groups nested as deep as allowed", bytes(nestedGroups(64)), Outcome::Failed,
+       "createKextModelFromProtobufModel:] <Error> R0 nil"},
+  });
 }
 
-// Four million empty messages in a file within the cap: only the first is
-// kept, so the load costs time, not gigabytes (it took 6 GB when every
-// message was kept).
+// The example model followed by four million empty messages, the file just
+// at the cap: read whole, the first message is uploaded, and only it is kept,
+// so the load costs time, not gigabytes (it took 6 GB when every message was).
 TEST(HostileModelFile, MillionsOfEmptyMessagesCostNoMemory) {
   Device device;
-  writeAll(device.path(kModel), std::string(PBStreamReader::kMaxFileSize, '\0'));
-  test::DaemonProcess daemon(device.dir(), "default");
-  ASSERT_TRUE(daemon.waitForLine({"Battery data upload failed"}, std::chrono::seconds(120)));
+  std::string file = readFileText(device.path(kModel));
+  file.resize(PBStreamReader::kMaxFileSize, '\0');
+  writeFile(device.path(kModel), file);
   long peakKiB = 0;
-  {
-    std::ifstream status("/proc/" + std::to_string(daemon.pid()) + "/status");
-    for (std::string line; std::getline(status, line);)
-      if (line.starts_with("VmHWM:")) peakKiB = std::stol(line.substr(6));
-  }
+  runDaemon(device, Outcome::Uploaded, {}, &peakKiB);
   // Under AddressSanitizer freed memory waits in a quarantine of 256 MiB.
   EXPECT_GT(peakKiB, 0);
   EXPECT_LT(peakKiB, 1024 * 1024) << "peak resident set in KiB";
-  daemon.signal(SIGTERM);
-  EXPECT_EQ(daemon.waitForExit(), 0);
-  // The daemon read it as the empty model it is.
-  EXPECT_TRUE(contains(daemon.lines(), "createKextModelFromProtobufModel:] <Error> R0 nil"))
-      << daemon.rawStderr();
 }
 
 // As root every file is readable, so the daemon runs as nobody, the way a
@@ -252,196 +228,73 @@ TEST(HostileModelFile, UnreadableIsRefused) {
       << testing::PrintToString(lines);
 }
 
-// Appends `n` elements to both lists of a resistance table; other
-// sub-messages have no lists.
-template <typename Table>
-void extendTable(Table* table, size_t n, float& v) {
-  if constexpr (std::is_same_v<Table, OTAResistanceData>) {
-    for (size_t i = 0; i < n; ++i) table->addResistance25C(v += 1);
-    for (size_t i = 0; i < n; ++i) table->addTemperatureCoeff(v += 1);
-  }
-}
-
-// Every list far longer than the record carries, the file just under the
-// cap: read whole, and the record holds the lists' first elements as ever.
-TEST(HostileModelFile, ListsFarLongerThanTheRecordJustUnderTheCap) {
-  Device device;
-  NSError error;
-  auto messages = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(
-      (fs::path(KOLVRAND_SOURCE_DIR) / "examples/device" / kModel).string(), &error);
-  ASSERT_TRUE(messages && !messages->empty()) << error.localizedDescription;
-  const auto original = messages->front();
-  auto handler = std::make_shared<BatteryModelDataHandler>();
-  handler->setLog(os_log_create("test", "batteryModelDataHandling"));
-  const auto record = handler->createKextModelFromProtobufModel(original.get());
-  ASSERT_TRUE(record);
-
-  auto model = std::static_pointer_cast<OTAParamRC>(original->copy());
-  const size_t cap = PBStreamReader::kMaxFileSize;
-  float v = 1.0f;
-  auto extend = [&](size_t n) {
-#define KVR_EXTEND_SUB(number, name, Name, key, Class) extendTable(model->name().get(), n, v);
-#define KVR_EXTEND_LIST(number, list, List, element, Element, key) \
-  for (size_t i = 0; i < n; ++i) model->add##Element(v += 1);
-#define KVR_EXTEND_NONE(...)
-    KVR_OTA_PARAM_RC_FIELDS(KVR_EXTEND_SUB, KVR_EXTEND_LIST, KVR_EXTEND_NONE, KVR_EXTEND_NONE,
-                            KVR_EXTEND_NONE)
-#undef KVR_EXTEND_SUB
-#undef KVR_EXTEND_LIST
-#undef KVR_EXTEND_NONE
-  };
-  // Whole rounds over every list while one more fits, then single elements of
-  // R0's first list (five bytes each) up to the cap.
-  const size_t before = model->encodedSize();
-  extend(1000);
-  const double perRound = (model->encodedSize() - before) / 1000.0;
-  extend(static_cast<size_t>((cap - model->encodedSize()) / perRound) - 2);
-  while (model->encodedSize() + 16 < cap) model->r0()->addResistance25C(0.5f);
-  const std::string file = test::modelFile({model});
-  ASSERT_LE(file.size(), cap);
-  ASSERT_GT(file.size(), cap - 32);
-  writeAll(device.path(kModel), file);
-
-  runDaemon(device, Outcome::Uploaded);
-  const std::string sent = readAll(device.path(kRecord));
-  ASSERT_EQ(sent.size(), sizeof(KextBatteryModel));
-  EXPECT_EQ(std::memcmp(sent.data(), record.get(), sent.size()), 0);
-}
-
-// device.json is the simulated device's whole kernel and registry: when it is
-// malformed, the daemon meets a device with no boot session and no services.
-TEST(HostileDeviceFile, ServesNoBootSessionAndTouchesNothing) {
-  std::string deep;
-  for (int i = 0; i < 200000; ++i) deep += '[';
-  deep += '1';
-  for (int i = 0; i < 200000; ++i) deep += ']';
-  const std::pair<const char*, std::string> cases[] = {
-      {"empty", ""},
-      {"not an object", "[1, 2, 3]"},
-      {"truncated", R"({"sysctl": {"kern.bootsessionuuid": "1111)"},
-      {"not UTF-8", "{\"sysctl\": {\"kern.bootsessionuuid\": \"\xff\xfe\"}}"},
-      {"bad $data", R"({"sysctl": {"kern.bootsessionuuid": {"$data": "zz"}}})"},
-      {"a property nested 200000 deep",
-       R"({"sysctl": {"kern.bootsessionuuid": "1"}, "registry": {"TesvarSmartBattery": {"BatteryData": )" +
-           deep + "}}}"},
-      {"a 4 MiB string",
-       R"({"sysctl": {"kern.bootsessionuuid": ")" + std::string(4 << 20, 'x') + "\", 1}}"},
-  };
-  for (const auto& [name, text] : cases) {
-    SCOPED_TRACE(name);
-    Device device;
-    writeAll(device.dir() / "device.json", text);
-    Lines lines = runDaemon(device, Outcome::NoBootSession);
-    EXPECT_TRUE(contains(lines, "error [device] simulated device " + device.dir().string() + ": "))
-        << testing::PrintToString(lines);
-  }
-  Device device;
-  fs::remove(device.dir() / "device.json");
-  fs::create_directory(device.dir() / "device.json");
-  Lines lines = runDaemon(device, Outcome::NoBootSession);
-  EXPECT_TRUE(contains(lines, "cannot read device.json: Is a directory"))
-      << testing::PrintToString(lines);
-}
-
-TEST(ValueJSON, NestingIsBounded) {
-  auto nested = [](int depth) {
-    return platform::JSON::parse(std::string(depth, '[') + std::string(depth, ']'));
-  };
-  EXPECT_TRUE(platform::valueFromJSON(nested(64)));
-  std::string error;
-  EXPECT_FALSE(platform::valueFromJSON(nested(65), &error));
-  EXPECT_EQ(
-      error, "$" + [] {
-        std::string s;
-        for (int i = 0; i < 64; ++i) s += "[0]";
-        return s;
-      }() + ": nested more than 64 deep");
-}
-
-// Kernel variables and driver data of the wrong shape.
+// Kernel variables and driver data of the wrong shape, and a device.json
+// the device cannot load at all (each malformed kind is in the platform
+// tests): the daemon meets a device with no boot session and no services.
 TEST(HostileDeviceData, IsRefusedWithAReason) {
-  struct Case {
-    const char* name;
-    std::function<void(json&)> arrange;
-    Outcome outcome;
-    std::string line;
+  const auto edit = [](std::function<void(json&)> change) {
+    return [change](Device& d) {
+      change(d.deviceJSON());
+      d.save();
+    };
   };
-  const Case cases[] = {
-      {"a boot UUID that is not UTF-8",
-       [](json& j) {
+  runCases({
+      {"device.json truncated",
+       [](Device& d) { writeFile(d.dir() / "device.json", R"({"sysctl": {"kern.boot)"); },
+       Outcome::NoBootSession, "error [device] simulated device "},
+      {"a boot UUID that is not UTF-8", edit([](json& j) {
          j["sysctl"]["kern.bootsessionuuid"] = {{"$data", "11c3281100"}};
-       },
+       }),
        Outcome::NoBootSession, kNoBootUUID},
-      {"a target type that is not UTF-8, needed for an unlisted chem ID",
-       [](json& j) {
+      {"a target type that is not UTF-8, needed for an unlisted chem ID", edit([](json& j) {
          j["sysctl"]["hw.targettype"] = {{"$data", "54ff00"}};
          j["registry"]["TesvarSmartBattery"]["BatteryData"]["AlgoChemID"] = 4660;
-       },
+       }),
        Outcome::Failed, kHandler + "getBatteryModelFileURLString:] <Error> deviceType nil"},
-      {"a hash that is a string",
-       [](json& j) {
+      {"a hash that is a string", edit([](json& j) {
          j["registry"]["TesvarKVR"]["KVRVector"] = {
              {"KVRBatteryModel", {{"RCParamsHash", std::string(40, '0')}}}};
-       },
+       }),
        Outcome::Unverified, kHandler + "verifyHashData:] <Error> RCParamsHash nil"},
-      {"a hash of 4 KiB",
-       [](json& j) {
+      {"a hash of 4 KiB", edit([](json& j) {
          j["registry"]["TesvarKVR"]["KVRVector"] = {
              {"KVRBatteryModel", {{"RCParamsHash", {{"$data", std::string(8192, 'a')}}}}}};
-       },
+       }),
        Outcome::Unverified, "mismatches with returnedHash"},
-      {"a chem ID that is a string",
-       [](json& j) { j["registry"]["TesvarSmartBattery"]["BatteryData"]["AlgoChemID"] = "6439"; },
+      {"a chem ID that is a string", edit([](json& j) {
+         j["registry"]["TesvarSmartBattery"]["BatteryData"]["AlgoChemID"] = "6439";
+       }),
        Outcome::Failed, "Battery data upload run for chemId 0x0"},
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.name);
-    Device device;
-    c.arrange(device.deviceJSON());
-    device.save();
-    Lines lines = runDaemon(device, c.outcome);
-    EXPECT_TRUE(contains(lines, c.line)) << testing::PrintToString(lines);
-  }
-}
-
-// A serial number longer than the 17 bytes the daemon reads is no serial
-// number: chem ID 5640 then takes its "a" model.
-TEST(HostileDeviceData, OverlongSerialNumberSelectsTheDefaultModel) {
-  Device device;
-  auto& battery = device.deviceJSON()["registry"]["TesvarSmartBattery"]["BatteryData"];
-  battery["AlgoChemID"] = 5640;
-  battery["BatterySerialNumber"] = "0123456789ABCDE8" + std::string(4096, 'Z');
-  device.save();
-  fs::create_directories(device.dir() / "Library/KVR/BatteryModels/R72");
-  fs::copy_file(fs::path(KOLVRAND_SOURCE_DIR) / "examples/models/R72/1608a.rcmodel",
-                device.dir() / "Library/KVR/BatteryModels/R72/1608a.rcmodel");
-  runDaemon(device, Outcome::Uploaded);
+      // More than the 17 bytes the daemon reads is no serial number: chem ID
+      // 5640 then takes its "a" model.
+      {"an overlong serial number",
+       [](Device& d) {
+         auto& battery = d.deviceJSON()["registry"]["TesvarSmartBattery"]["BatteryData"];
+         battery["AlgoChemID"] = 5640;
+         battery["BatterySerialNumber"] = "0123456789ABCDE8" + std::string(4096, 'Z');
+         d.save();
+         fs::create_directories(d.dir() / "Library/KVR/BatteryModels/R72");
+         fs::copy_file(fs::path(KOLVRAND_SOURCE_DIR) / "examples/models/R72/1608a.rcmodel",
+                       d.dir() / "Library/KVR/BatteryModels/R72/1608a.rcmodel");
+       },
+       Outcome::Uploaded, kSucceeded},
+  });
 }
 
 // A settings file that is truncated or holds no object reads as empty: the
 // boot session counts as new, the upload runs and a whole file replaces it.
 TEST(HostileStateFile, IsReadAsEmptyAndReplacedWhole) {
-  const std::pair<const char*, std::string> cases[] = {
-      {"truncated", Device::kEarlierState.dump(2).substr(0, 30)},
-      {"an array", R"(["savedBootUUID", "6f1c2b7e-3d4a-4e5f-9a1b-2c3d4e5f6a7b"])"},
-      {"a string", R"("savedBootUUID")"},
-      {"empty", ""},
-      {"binary", std::string("\x00\xff\x7b\x22", 4)},
-  };
-  for (const auto& [name, text] : cases) {
-    SCOPED_TRACE(name);
-    Device device;
-    writeAll(device.path(kState), text);
-    test::DaemonProcess daemon(device.dir(), "default");
-    ASSERT_TRUE(daemon.waitForLine({"Battery data upload succeeded"})) << daemon.rawStderr();
-    daemon.signal(SIGTERM);
-    EXPECT_EQ(daemon.waitForExit(), 0);
-    EXPECT_TRUE(contains(daemon.lines(), "error [defaults] " + device.path(kState).string() +
-                                             " is not a JSON object; reading it as empty"))
-        << daemon.rawStderr();
-    EXPECT_EQ(json::parse(readAll(device.path(kState)), nullptr, false),
-              (json{{"savedChemID", 8552}, {"savedBootUUID", device.bootUUID()}}));
-  }
+  std::vector<Case> cases;
+  for (const auto& [name, text] : std::initializer_list<std::pair<const char*, std::string>>{
+           {"truncated", Device::kEarlierState.dump(2).substr(0, 30)},
+           {"an array", R"(["savedBootUUID", "6f1c2b7e-3d4a-4e5f-9a1b-2c3d4e5f6a7b"])"},
+           {"a string", R"("savedBootUUID")"},
+           {"empty", ""},
+           {"binary", std::string("\x00\xff\x7b\x22", 4)},
+       })
+    cases.push_back({name, [text](Device& d) { writeFile(d.path(kState), text); },
+                     Outcome::Uploaded, " is not a JSON object; reading it as empty"});
+  runCases(cases);
 }
 
 }  // namespace
