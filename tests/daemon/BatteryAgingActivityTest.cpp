@@ -12,7 +12,6 @@ namespace kolvrand {
 namespace {
 
 using Lines = std::vector<std::string>;
-
 const std::string kCheckIn = "debug [main] battery aging update checking in! ";
 const std::string kTrigger = "debug [main] battery aging periodic trigger";
 const std::string kWorkload = "debug [main] trigger condition met, start to run some workload...";
@@ -24,6 +23,7 @@ struct Case {
   std::optional<bool> flagBefore;  // nullopt: absent
   Lines expected;
   std::optional<bool> flagAfter;
+  bool agent = true;
 };
 
 TEST(BatteryAgingActivity, EachStateLogsAndLeavesTheFlag) {
@@ -44,6 +44,7 @@ TEST(BatteryAgingActivity, EachStateLogsAndLeavesTheFlag) {
       {"wait, flag false", XPC_ACTIVITY_STATE_WAIT, false, {}, false},
       {"done, flag absent", XPC_ACTIVITY_STATE_DONE, std::nullopt, {}, std::nullopt},
       {"defer, flag left set", XPC_ACTIVITY_STATE_DEFER, true, {kWorkload, kFinished}, false},
+      {"no agent: only the state is logged", XPC_ACTIVITY_STATE_RUN, true, {kTrigger}, true, false},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -53,7 +54,8 @@ TEST(BatteryAgingActivity, EachStateLogsAndLeavesTheFlag) {
     if (c.flagBefore) agent->defaults()->setBool(*c.flagBefore, "updateConditionMet");
 
     XPCActivity activity{"com.tesvar.kolvrand.batteryAgingUpdate", c.state};
-    batteryAgingActivityHandler(&activity, os_log_create(DaemonIdentifier, "main"), agent.get());
+    batteryAgingActivityHandler(&activity, os_log_create(DaemonIdentifier, "main"),
+                                c.agent ? agent.get() : nullptr);
 
     EXPECT_EQ(device.logLines(), c.expected);
     nlohmann::json state = device.state();
@@ -62,13 +64,6 @@ TEST(BatteryAgingActivity, EachStateLogsAndLeavesTheFlag) {
     else
       EXPECT_FALSE(state.contains("updateConditionMet"));
   }
-}
-
-TEST(BatteryAgingActivity, NilAgentOnlyLogsTheState) {
-  test::TestDevice device;
-  XPCActivity activity{"com.tesvar.kolvrand.batteryAgingUpdate", XPC_ACTIVITY_STATE_RUN};
-  batteryAgingActivityHandler(&activity, os_log_create(DaemonIdentifier, "main"), nullptr);
-  EXPECT_EQ(device.logLines(), Lines{kTrigger});
 }
 
 }  // namespace

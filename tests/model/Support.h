@@ -11,20 +11,11 @@
 
 namespace kolvrand::test {
 
-// "90 01 0a" -> {0x90, 0x01, 0x0a}; spaces are ignored.
+// "90 01 0a" -> {0x90, 0x01, 0x0a}: pairs of digits, one space apart.
 inline std::vector<uint8_t> fromHex(std::string_view hex) {
   std::vector<uint8_t> out;
-  int high = -1;
-  for (char c : hex) {
-    if (c == ' ') continue;
-    const int v = c <= '9' ? c - '0' : (c | 0x20) - 'a' + 10;
-    if (high < 0) {
-      high = v;
-    } else {
-      out.push_back(static_cast<uint8_t>(high << 4 | v));
-      high = -1;
-    }
-  }
+  for (size_t i = 0; i + 1 < hex.size(); i += 3)
+    out.push_back(static_cast<uint8_t>(std::stoi(std::string(hex.substr(i, 2)), nullptr, 16)));
   return out;
 }
 

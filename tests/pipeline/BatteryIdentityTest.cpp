@@ -17,14 +17,14 @@ const std::string kSuffixMethod =
     "error [batteryModelDataHandling] -[BatteryModelDataHandler "
     "getSpecialCaseBatteryModelIdentifier:] <Error> ";
 
+// The example device with other battery data: null takes the battery driver
+// away, "absent" only its data.
 nlohmann::json withBatteryData(const nlohmann::json& batteryData) {
   nlohmann::json json = test::defaultDeviceJSON();
-  if (batteryData.is_null())
-    json["registry"].erase("TesvarSmartBattery");
-  else if (batteryData == "absent")
-    json["registry"]["TesvarSmartBattery"].erase("BatteryData");
-  else
-    json["registry"]["TesvarSmartBattery"]["BatteryData"] = batteryData;
+  auto& battery = json["registry"]["TesvarSmartBattery"];
+  battery["BatteryData"] = batteryData;
+  if (batteryData == "absent") battery.erase("BatteryData");
+  if (batteryData.is_null()) json["registry"].erase("TesvarSmartBattery");
   return json;
 }
 
@@ -56,9 +56,6 @@ TEST(BatteryIdentity, ChemIDIsReadReplacedAndStored) {
     EXPECT_EQ(device.logLines(), c.lines);
     EXPECT_EQ(device.state()["savedChemID"], c.chemID);
   }
-}
-
-TEST(BatteryIdentity, NilKeyIsRefused) {
   test::TestDevice device;
   EXPECT_EQ(BatteryModelDataHandler::init()->getIntValueForKeyFromBatteryData(nullptr), 0);
   EXPECT_EQ(device.logLines(), Lines{kIntMethod + "key null"});

@@ -5,7 +5,6 @@
 // definition.
 #include <gtest/gtest.h>
 
-#include <cstdio>
 #include <string>
 
 #include "model/OTAParamRC.h"
@@ -37,51 +36,28 @@ constexpr Example kExamples[] = {
      "1b50f4236af0c0adec44bb492118b90940445413"},
 };
 
-std::string hex(const SHA1Digest& digest) {
-  std::string out;
-  char byte[3];
-  for (uint8_t b : digest) std::snprintf(byte, sizeof byte, "%02x", b), out += byte;
-  return out;
-}
-
-std::vector<uint8_t> readExample(const Example& e) {
-  NSError error;
-  auto bytes = PBStreamReader::readFile(std::string(KOLVRAND_SOURCE_DIR) + "/" + e.file, &error);
-  EXPECT_TRUE(bytes) << error.description();
-  return bytes ? *bytes : std::vector<uint8_t>{};
-}
-
-TEST(ExampleModels, DecodeAndEncodeAgainToTheirFileByteForByte) {
-  for (const Example& e : kExamples) {
-    SCOPED_TRACE(e.file);
-    const std::vector<uint8_t> file = readExample(e);
-    NSError error;
-    auto models = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(file, &error);
-    ASSERT_TRUE(models) << error.description();
-    ASSERT_EQ(models->size(), 1u);
-    EXPECT_EQ(models->front()->chemID(), e.chemID);
-    EXPECT_EQ(
-        PBStreamWriter::dataForMessages(std::span<const std::shared_ptr<OTAParamRC>>(*models)),
-        file);
-  }
-}
-
-TEST(ExampleModels, RecordsHaveTheirFixedDigests) {
+TEST(ExampleModels, EncodeAgainToTheirFileAndGiveRecordsOfTheirFixedDigests) {
   test::TestDevice device;
   auto handler = BatteryModelDataHandler::init();
   for (const Example& e : kExamples) {
     SCOPED_TRACE(e.file);
-    const std::vector<uint8_t> file = readExample(e);
     NSError error;
-    auto models = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(file, &error);
+    auto file = PBStreamReader::readFile(std::string(KOLVRAND_SOURCE_DIR) + "/" + e.file, &error);
+    ASSERT_TRUE(file) << error.description();
+    auto models = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(*file, &error);
     ASSERT_TRUE(models && models->size() == 1) << error.description();
+    EXPECT_EQ(models->front()->chemID(), e.chemID);
+    EXPECT_EQ(
+        PBStreamWriter::dataForMessages(std::span<const std::shared_ptr<OTAParamRC>>(*models)),
+        *file);
     auto record = handler->createKextModelFromProtobufModel(models->front().get());
     ASSERT_TRUE(record);
     const auto* bytes = reinterpret_cast<const uint8_t*>(record.get());
     // The chem ID leads the record, least significant byte first.
     EXPECT_EQ(bytes[0], e.chemID & 0xff);
     EXPECT_EQ(bytes[1], e.chemID >> 8);
-    EXPECT_EQ(hex(sha1(bytes, kKextBatteryModelSize)), e.recordSHA1);
+    const SHA1Digest digest = sha1(bytes, kKextBatteryModelSize);
+    EXPECT_EQ(hexString(digest.data(), digest.size()), e.recordSHA1);
   }
 }
 

@@ -20,22 +20,15 @@ using nlohmann::json;
 
 const std::string kHandler = "[batteryModelDataHandling] ";
 
-TEST(DeviceType, TableRowsNeedNoKernelQuery) {
+// Chem IDs of the table never query the kernel; others fall back to the
+// target type.
+TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
   const std::pair<uint32_t, const char*> rows[] = {
       {5426, "R71"},   {5458, "R70"},  {5638, "R70"},   {5639, "R72"},   {5640, "R72"},
       {5648, "R72"},   {5649, "R72"},  {5689, "R70"},   {6177, "K517"},  {6201, "T618e"},
       {6249, "K517"},  {6259, "K517"}, {6278, "T604"},  {6408, "T618e"}, {6436, "T618e"},
       {6439, "T618e"}, {6489, "T604"}, {8552, "T618e"},
   };
-  json j = test::defaultDeviceJSON();
-  j["sysctl"].erase("hw.targettype");
-  test::TestDevice device(j);
-  auto handler = BatteryModelDataHandler::init();
-  for (auto [chemID, type] : rows) EXPECT_EQ(handler->getDeviceType(chemID), type) << chemID;
-  EXPECT_EQ(device.logLines(), Lines{});
-}
-
-TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
   struct Case {
     json targetType;  // null: absent
     std::optional<std::string> result;
@@ -58,10 +51,7 @@ TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
   for (const Case& c : cases) {
     SCOPED_TRACE(c.targetType.dump());
     json j = test::defaultDeviceJSON();
-    if (c.targetType.is_null())
-      j["sysctl"].erase("hw.targettype");
-    else
-      j["sysctl"]["hw.targettype"] = c.targetType;
+    j.merge_patch({{"sysctl", {{"hw.targettype", c.targetType}}}});
     test::TestDevice device(j);
     auto handler = BatteryModelDataHandler::init();
     for (uint32_t chemID : {0u, 5637u, 5650u, 5688u, 5690u, 6200u, 6440u}) {
@@ -69,6 +59,9 @@ TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
       EXPECT_EQ(handler->getDeviceType(chemID), c.result) << chemID;
       EXPECT_EQ(device.logLines(), c.lines) << chemID;
     }
+    device.clearLog();
+    for (auto [chemID, type] : rows) EXPECT_EQ(handler->getDeviceType(chemID), type) << chemID;
+    EXPECT_EQ(device.logLines(), Lines{});
   }
 }
 

@@ -1,6 +1,7 @@
 // The JSON layer of rcmodel and the dictionary import under it, in process:
-// random models round trip, floats are written shortest and read back exactly,
-// and wrong JSON is refused with the path of the first wrong value.
+// floats are written shortest and read back exactly, and wrong JSON is refused
+// with the path of the first wrong value. (Random models round trip through
+// the tool itself in the rcmodel test.)
 #include <gtest/gtest.h>
 
 #include <charconv>
@@ -15,37 +16,9 @@ namespace {
 using rcmodel::floatJSON;
 using rcmodel::JSONError;
 using rcmodel::modelsFromJSON;
-using rcmodel::renderJSON;
 
 uint32_t bits(float f) {
   return std::bit_cast<uint32_t>(f);
-}
-
-TEST(ModelJSON, RandomModelsRoundTrip) {
-  test::RandomModels random(20261122);
-  for (int i = 0; i < 300; ++i) {
-    SCOPED_TRACE(i);
-    const Value dictionary = random.next();
-    const std::string json = renderJSON(dictionary);
-
-    // The import is the exact reverse of the dictionary form.
-    DictionaryError why;
-    auto model = OTAParamRC::fromDictionary(dictionary, &why);
-    ASSERT_TRUE(model) << why.path << ": " << why.reason;
-    EXPECT_TRUE(model->dictionaryRepresentation() == dictionary) << json;
-
-    // JSON -> message -> wire -> message -> JSON gives the same text, and the
-    // message read from JSON encodes to the same bytes.
-    JSONError error;
-    auto fromJSON = modelsFromJSON(json, true, &error);
-    ASSERT_TRUE(fromJSON) << error.message();
-    const std::vector<uint8_t> wire = (*fromJSON)[0]->data();
-    EXPECT_EQ(wire, model->data());
-    OTAParamRC decoded;
-    PBDataReader reader(wire.data(), wire.size());
-    ASSERT_TRUE(decoded.readFrom(reader));
-    EXPECT_EQ(renderJSON(decoded.dictionaryRepresentation()), json);
-  }
 }
 
 TEST(ModelJSON, FloatsAreTheShortestTextThatReadsBack) {
@@ -111,13 +84,6 @@ TEST(ModelJSON, EnumTakesNamesTheUnknownFormAndIntegers) {
     EXPECT_TRUE((*models)[0]->hasMLBConfig());
     EXPECT_EQ((*models)[0]->mLBConfig(), value) << json;
   }
-  // Only the text the dictionary would show for a value is taken.
-  for (const char* json : {"\"(unknown: 0)\"", "\"(unknown: 07)\"", "\"(unknown: 2147483648)\"",
-                           "\"(unknown: )\"", "\"kkvrregularmlb\"", "2147483648", "1.5", "true"}) {
-    JSONError error;
-    EXPECT_FALSE(modelsFromJSON(std::string("{\"MLBConfig\":") + json + "}", true, &error)) << json;
-    EXPECT_EQ(error.path, "$.MLBConfig") << json;
-  }
 }
 
 TEST(ModelJSON, WrongJSONNamesThePathOfTheFirstWrongValue) {
@@ -128,7 +94,8 @@ TEST(ModelJSON, WrongJSONNamesThePathOfTheFirstWrongValue) {
     bool single;
     std::string path;
     const char* reason;
-  } const cases[] = {
+  };
+  std::vector<Case> cases = {
       {"{\"R0x\": []}", false, "$.R0x", "unknown key"},
       {"{\"r0\": {}}", false, "$.r0", "did you mean \"R0\""},
       {"{\"chemID\": -1}", false, "$.chemID", "-1 is out of range"},
@@ -151,6 +118,10 @@ TEST(ModelJSON, WrongJSONNamesThePathOfTheFirstWrongValue) {
       {"", false, "$", "not valid JSON"},
       {std::string(100000, '[') + std::string(100000, ']'), false, deep, "nested deeper than 64"},
   };
+  // Of an enum, only the text the dictionary would show for a value is taken.
+  for (const char* json : {"\"(unknown: 0)\"", "\"(unknown: 07)\"", "\"(unknown: 2147483648)\"",
+                           "\"(unknown: )\"", "\"kkvrregularmlb\"", "2147483648", "1.5", "true"})
+    cases.push_back({std::string("{\"MLBConfig\":") + json + "}", false, "$.MLBConfig", ""});
   for (const Case& c : cases) {
     JSONError error;
     const std::string shown = c.json.substr(0, 80);
