@@ -79,7 +79,7 @@ TEST(FormatLogMessage, MatchesPrintf) {
 }
 
 TEST(LogLevels, EnablesLevelsPerCategory) {
-  // Levels spec, category, and which of error, default, debug are enabled.
+  // Level setting, category, and which of error, default, debug are enabled.
   const std::tuple<const char*, const char*, const char*> cases[] = {
       {"", "main", "110"},
       {"DEBUG", "any", "111"},
