@@ -110,8 +110,7 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
   bool start_array(std::size_t) override { return open(Value(Array())); }
   bool end_array() override { return close(); }
 
-  bool parse_error(std::size_t position, const std::string&,
-                   const nlohmann::detail::exception& e) override {
+  bool parse_error(std::size_t, const std::string&, const nlohmann::detail::exception& e) override {
     // The library's text, without its "[json.exception.parse_error.101] ".
     std::string what = e.what();
     if (what.starts_with("[json.exception.")) {
@@ -127,7 +126,6 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
         what.replace(digits, end - digits, std::to_string(line - 1 + inSlice));
       }
     }
-    (void)position;
     error = {"$", "not valid JSON: " + what};
     return false;
   }
