@@ -46,7 +46,7 @@ std::string fileContents(const fs::path& path) {
 TEST(Transfer, EachOutcomeLeavesItsChainTheDriverAndTheMark) {
   const auto model = makeExampleModel(0x2168);
   const std::string good = test::modelFile({model});
-  const auto built = BatteryModelDataHandler::init()->createKextModelFromProtobufModel(model.get());
+  const auto built = BatteryModelDataHandler().createKextModelFromProtobufModel(model.get());
   const std::string record(reinterpret_cast<const char*>(built.get()), sizeof *built);
   const SHA1Digest digest = sha1(record.data(), record.size());
   const std::string hash(digest.begin(), digest.end());
