@@ -91,8 +91,7 @@ LevelConfig levelsFromEnvironment(std::vector<std::string>* notUnderstood) {
   const char* env = std::getenv("KOLVRAND_LOG_LEVEL");
   if (!env) return {};
   LevelConfig config = parseLevels(env, notUnderstood);
-  if (notUnderstood->empty()) return config;
-  return {};
+  return notUnderstood->empty() ? config : LevelConfig{};
 }
 
 }  // namespace
