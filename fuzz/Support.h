@@ -2,9 +2,9 @@
 // the input), and a log sink that formats every message and drops it.
 #pragma once
 
+#include <cstddef>
+#include <cstdint>
 #include <cstdlib>
-#include <memory>
-#include <string_view>
 
 #include "platform/Log.h"
 
@@ -14,16 +14,13 @@ inline void check(bool condition) {
   if (!condition) std::abort();
 }
 
-// Messages are still formatted (their arguments come from the input, so the
-// formatting is under test too), then dropped instead of flooding stderr.
-class DiscardingSink : public LogSink {
- public:
-  void write(LogLevel, std::string_view, std::string_view, std::string_view message) override {
-    check(message.size() < (size_t{1} << 30));
-  }
-};
-
+// Every message down to debug is still formatted (its arguments come from the
+// input, so the formatting is under test too), then dropped instead of
+// flooding stderr.
 inline void quietLogs() {
+  struct DiscardingSink : LogSink {
+    void write(LogLevel, std::string_view, std::string_view, std::string_view) override {}
+  };
   setLogSink(std::make_shared<DiscardingSink>());
   setLogLevelSpec("debug");
 }

@@ -3,11 +3,7 @@
 // A stream that reads must survive being written out and read again, and a
 // refused one must say why.
 #include <algorithm>
-#include <cstddef>
-#include <cstdint>
 #include <cstring>
-#include <span>
-#include <vector>
 
 #include "fuzz/Support.h"
 #include "model/OTAParamRC.h"
@@ -15,50 +11,35 @@
 #include "pipeline/KextBatteryModel.h"
 #include "pipeline/KextBatteryModelSources.h"
 #include "pipeline/PBStreamReader.h"
+#include "pipeline/PBStreamWriter.h"
 
 using namespace kolvrand;
-using fuzz::check;
 
-namespace {
-
-// The framing of a model file: each message's length as a varint, then its bytes.
-void appendDelimited(std::vector<uint8_t>& out, const std::vector<uint8_t>& message) {
-  uint64_t n = message.size();
-  do {
-    uint8_t b = n & 0x7f;
-    n >>= 7;
-    out.push_back(n ? b | 0x80 : b);
-  } while (n);
-  out.insert(out.end(), message.begin(), message.end());
-}
-
-}  // namespace
+static std::shared_ptr<BatteryModelDataHandler> handler;
 
 extern "C" int LLVMFuzzerInitialize(int*, char***) {
   fuzz::quietLogs();
+  handler = std::make_shared<BatteryModelDataHandler>();
+  handler->setLog(os_log_create("com.tesvar.kolvrand", "batteryModelDataHandling"));
   return 0;
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   NSError error;
-  auto messages = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(
-      std::span<const uint8_t>(data, size), &error);
-  if (!messages) {
-    check(!error.localizedDescription.empty());
-    return 0;
-  }
-  check(messages->empty() == (size == 0));
+  auto messages = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>({data, size}, &error);
+  fuzz::check(messages || !error.localizedDescription.empty());
+  fuzz::check(!messages || messages->empty() == (size == 0));
+  if (!messages) return 0;
 
   // The first messages, written out as a stream, read back to the same bytes.
   // Only the first: an input of thousands of empty messages would otherwise
   // spend the run writing and rereading them.
   const size_t checked = std::min<size_t>(messages->size(), 16);
-  std::vector<uint8_t> rewritten;
-  for (size_t i = 0; i < checked; ++i) appendDelimited(rewritten, (*messages)[i]->data());
-  auto again = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(
-      std::span<const uint8_t>(rewritten), &error);
-  check(again && again->size() == checked);
-  for (size_t i = 0; i < checked; ++i) check((*again)[i]->data() == (*messages)[i]->data());
+  const std::vector<uint8_t> rewritten =
+      PBStreamWriter::dataForMessages<OTAParamRC>({messages->data(), checked});
+  auto again = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(std::span(rewritten), &error);
+  fuzz::check(again && again->size() == checked);
+  for (size_t i = 0; i < checked; ++i) fuzz::check((*again)[i]->data() == (*messages)[i]->data());
 
   if (messages->empty()) return 0;
   // A model that fills the record goes on to the builder, whose copies the
@@ -69,7 +50,6 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   bool fills = true;
   for (const KextTableSource& t : kextTableSources()) {
     const OTAResistanceData* table = t.table(model);
-    fills = fills && table;
     for (const KextTableListSource& l : kextTableListSources())
       fills = fills && table && l.elements(*table).size() >= l.count;
   }
@@ -77,17 +57,12 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     fills = fills && l.elements(model).size() >= l.count;
   if (!fills && size % 8 != 0) return 0;
 
-  static const auto handler = [] {
-    auto h = std::make_shared<BatteryModelDataHandler>();
-    h->setLog(os_log_create("com.tesvar.kolvrand", "batteryModelDataHandling"));
-    return h;
-  }();
-  auto record = handler->createKextModelFromProtobufModel(messages->front().get());
-  check(static_cast<bool>(record) == fills);
+  auto record = handler->createKextModelFromProtobufModel(&model);
+  fuzz::check(static_cast<bool>(record) == fills);
   if (!record) return 0;
   // The record depends on the model alone: the reread model gives the same bytes.
   auto second = handler->createKextModelFromProtobufModel(again->front().get());
-  check(second && std::memcmp(record.get(), second.get(), sizeof(KextBatteryModel)) == 0);
-  check(record->chemID == model.chemID());
+  fuzz::check(second && std::memcmp(record.get(), second.get(), sizeof(KextBatteryModel)) == 0);
+  fuzz::check(record->chemID == model.chemID());
   return 0;
 }
