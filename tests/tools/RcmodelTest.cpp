@@ -5,7 +5,6 @@
 #include <sys/stat.h>
 
 #include <algorithm>
-#include <functional>
 #include <regex>
 #include <thread>
 
@@ -31,7 +30,7 @@ bool matches(const std::string& text, const std::string& pattern) {
 }
 
 // The file of one example model, changed by `change`.
-std::string exampleFile(const std::function<void(OTAParamRC&)>& change = {}) {
+std::string exampleFile(void (*change)(OTAParamRC&) = nullptr) {
   auto model = makeExampleModel(0x2168);
   if (change) change(*model);
   return test::modelFile({model});
@@ -57,22 +56,17 @@ class Rcmodel : public ::testing::Test {
 // decode then encode gives the same file, of one message or several, and of
 // one bare message as protoc reads and writes it.
 TEST_F(Rcmodel, DecodeThenEncodeGivesTheSameFile) {
-  auto example = [](const char* name) {
-    return readWhole(fs::path(KOLVRAND_SOURCE_DIR) / "examples/models" / name);
-  };
-  const std::string one = example("R72/1608a.rcmodel");
-  for (const std::string& bytes :
-       {one, one + example("K517/1821.rcmodel") + example("T604/1886.rcmodel")}) {
+  const fs::path examples = fs::path(KOLVRAND_SOURCE_DIR) / "examples/models";
+  const std::string one = readWhole(examples / "R72/1608a.rcmodel");
+  for (const std::string& bytes : {one, one + readWhole(examples / "K517/1821.rcmodel") +
+                                            readWhole(examples / "T604/1886.rcmodel")}) {
     writeWhole(s / "in", bytes);
-    ToolRun decode = s.rcmodel({"decode", "in"});
-    ASSERT_EQ(decode.status, 0) << decode.err;
-    EXPECT_EQ(s.rcmodel({"encode", "-", "-o", "-"}, decode.out).out, bytes);
+    EXPECT_EQ(s.rcmodel({"encode", "-", "-o", "-"}, s.rcmodel({"decode", "in"}).out).out, bytes);
   }
   const std::vector<uint8_t> data = makeExampleModel(0x1608)->data();
   const std::string bare(data.begin(), data.end());
-  ToolRun json = s.rcmodel({"decode", "--raw", "-"}, bare);
-  ASSERT_EQ(json.status, 0) << json.err;
-  EXPECT_EQ(s.rcmodel({"encode", "--raw", "-", "-o", "-"}, json.out).out, bare);
+  const std::string json = s.rcmodel({"decode", "--raw", "-"}, bare).out;
+  EXPECT_EQ(s.rcmodel({"encode", "--raw", "-", "-o", "-"}, json).out, bare);
 }
 
 // What each use returns and prints: stderr must match `err` (be empty for ""),
@@ -85,6 +79,7 @@ TEST_F(Rcmodel, ExitCodesAndMessages) {
   } const cases[] = {
       {2, {}, "^usage: rcmodel COMMAND"},
       {0, {"--help"}, "", "^usage: rcmodel COMMAND[\\s\\S]*decode[\\s\\S]*status"},
+      {0, {"status", "--help"}, "", "^usage: rcmodel status\n"},
       {2, {"frobnicate"}, "^rcmodel: unknown command \"frobnicate\"; run rcmodel --help"},
       {2, {"plot", "-x"}, "^rcmodel plot: unknown option -x; see rcmodel plot --help\n$"},
       // Each command's own check of its operands.
@@ -107,15 +102,8 @@ TEST_F(Rcmodel, ExitCodesAndMessages) {
       {2, {"encode", "no", "-o", "out"}, "^rcmodel encode: no: cannot open"},
       {0, {"record", "good"}, "", "^[0-9a-f]{40}\n$"},
       // The daemon's own reasons, then what to do.
-      {1,
-       {"record", "short", "-o", "out"},
-       "R0 nil: .*\nrcmodel record: short: the daemon would refuse"},
+      {1, {"record", "short", "-o", "out"}, "R0 nil: .*\n.*short: the daemon would refuse"},
       {1, {"record", "empty"}, "protobufModelRCParams nil\n.*empty: the daemon cannot load this"},
-      {1,
-       {"validate", "good", "short", "cut"},
-       "cut: message 0",
-       "^good\n[\\s\\S]*ok: the daemon would load it[\\s\\S]*\n\nshort\n[\\s\\S]*R0 +- +- "
-       "+MISSING[\\s\\S]*refused[\\s\\S]*\n\ncut\n  decodes: no"},
       {1, {"plot", "cut", "-o", "out"}, "cut: message 0"},
   };
   for (const Case& c : cases) {
@@ -125,10 +113,6 @@ TEST_F(Rcmodel, ExitCodesAndMessages) {
     EXPECT_TRUE(c.err.empty() ? run.err.empty() : matches(run.err, c.err)) << run.err;
     EXPECT_TRUE(matches(run.out, c.out.empty() ? "^$" : c.out)) << run.out;
     EXPECT_FALSE(fs::exists(s / "out"));
-  }
-  for (std::string command : {"decode", "encode", "record", "validate", "plot", "status"}) {
-    ToolRun help = s.rcmodel({command, "--help"});
-    EXPECT_TRUE(help.status == 0 && help.out.starts_with("usage: rcmodel " + command)) << command;
   }
 }
 
@@ -167,12 +151,11 @@ TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
     // stays behind a hard link) with its old mode.
     writeWhole(s / "target", "old");
     fs::permissions(s / "target", fs::perms(0600));
-    fs::remove(s / "hard");
-    fs::create_hard_link(s / "target", s / "hard");
+    fs::create_hard_link(s / "target", s / (std::string("hard.") + command));
     EXPECT_EQ(run("link").status, 0);
     EXPECT_TRUE(fs::is_symlink(s / "link"));
     EXPECT_EQ(readWhole(s / "target"), expected);
-    EXPECT_EQ(readWhole(s / "hard"), "old");
+    EXPECT_EQ(readWhole(s / (std::string("hard.") + command)), "old");
     EXPECT_EQ(fs::status(s / "target").permissions(), fs::perms(0600));
 
     std::string heard;
@@ -182,24 +165,21 @@ TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
     EXPECT_TRUE(fs::is_fifo(s / "fifo"));
     EXPECT_EQ(heard, expected);
 
-    ToolRun directory = run("ro");
-    EXPECT_EQ(directory.status, 1);
-    EXPECT_TRUE(
-        matches(directory.err, "^rcmodel [a-z]+: ro: is a directory; give a file to write\n$"))
-        << directory.err;
-    ToolRun denied = run("ro/out", asUser);
-    EXPECT_EQ(denied.status, 1);
-    EXPECT_TRUE(matches(
-        denied.err,
-        "^rcmodel [a-z]+: ro/out: cannot write: Permission denied; it was left as it was\n$"))
-        << denied.err;
+    for (const auto& [out, why] :
+         {std::pair{"ro", "is a directory; give a file to write"},
+          {"ro/out", "cannot write: Permission denied; it was left as it was"}}) {
+      ToolRun refused = run(out, asUser);
+      EXPECT_EQ(refused.status, 1);
+      EXPECT_TRUE(matches(refused.err, std::string("^rcmodel [a-z]+: ") + out + ": " + why + "\n$"))
+          << refused.err;
+    }
     EXPECT_EQ(readWhole(s / "ro/out"), "old");
   }
   fs::permissions(s / "ro", fs::perms(0755));
 }
 
 // Every list in the record is reported, by the key its author writes, against
-// the record's count.
+// the record's count; then each further file in turn.
 TEST_F(Rcmodel, ValidateReportsEveryListAgainstTheRecord) {
   auto model = makeExampleModel(0x2168);
   std::vector<float> grid(model->gridOCVs(), model->gridOCVs() + model->gridOCVsCount());
@@ -208,38 +188,38 @@ TEST_F(Rcmodel, ValidateReportsEveryListAgainstTheRecord) {
   model->setAgingCoeffForR1s(aging.data(), aging.size());
   model->setRCFreq4(nullptr);
   model->setHasMLBConfig(false);
-  writeWhole(s / "m.rcmodel", test::modelFile({model, model}));
-  ToolRun run = s.rcmodel({"validate", "m.rcmodel"});
+  ToolRun run = s.rcmodel({"validate", "-", "cut", "good"}, test::modelFile({model, model}));
   EXPECT_EQ(run.status, 1);
-  for (const char* text : {"decodes: yes, 2 messages; the daemon uses the first",
-                           "gridOCV +300 +303  SHORT: 3 missing, the daemon refuses this",
-                           "agingCoeffForR1 +110 +102  8 beyond the record, dropped",
-                           "RCFreq4 +- +-  MISSING: the record needs all 17 resistance tables",
-                           "R0.resistance25C +51 +51  ok", "R0.temperatureCoeff +153 +153  ok",
-                           "note: MLBConfig not set; the record carries 0",
-                           "refused: the daemon would not load this model"})
+  EXPECT_TRUE(matches(run.err, "^rcmodel validate: cut: message 0")) << run.err;
+  for (const char* text :
+       {"^-\n  decodes: yes, 2 messages; the daemon uses the first",
+        "gridOCV +300 +303  SHORT: 3 missing, the daemon refuses this",
+        "agingCoeffForR1 +110 +102  8 beyond the record, dropped",
+        "RCFreq4 +- +-  MISSING: the record needs all 17 resistance tables",
+        "R0.resistance25C +51 +51  ok", "R0.temperatureCoeff +153 +153  ok",
+        "note: MLBConfig not set; the record carries 0",
+        "refused: the daemon would not load this model\n\ncut\n  decodes: no",
+        "\n\ngood\n[\\s\\S]*\n  ok: the daemon would load it; record SHA-1 [0-9a-f]{40}\n$"})
     EXPECT_TRUE(matches(run.out, text)) << text << "\n" << run.out;
   // One row per resistance-table list and per model list.
-  EXPECT_EQ(std::count(run.out.begin(), run.out.end(), '\n'), 1 + 1 + 1 + 16 * 2 + 1 + 22 + 1 + 1);
+  EXPECT_EQ(std::count(run.out.begin(), run.out.begin() + run.out.find("\n\ncut"), '\n'),
+            1 + 1 + 1 + 16 * 2 + 1 + 22 + 1);
 }
 
 TEST_F(Rcmodel, PlotDrawsTheGridAndEveryTable) {
-  writeWhole(s / "m.rcmodel", exampleFile([](OTAParamRC& m) { m.setBaselineR4(nullptr); }));
-  ToolRun run = s.rcmodel({"plot", "m.rcmodel", "-o", "m.svg"});
+  const std::string model = exampleFile([](OTAParamRC& m) { m.setBaselineR4(nullptr); });
+  ToolRun run = s.rcmodel({"plot", "-", "-o", "-"}, model);
   ASSERT_EQ(run.status, 0) << run.err;
-  const std::string svg = readWhole(s / "m.svg");
+  const std::string& svg = run.out;
   EXPECT_TRUE(svg.starts_with("<?xml") && svg.ends_with("</svg>\n")) << svg.substr(0, 100);
-  auto count = [&](const std::string& what) {
-    size_t n = 0;
-    for (size_t at = svg.find(what); at != std::string::npos; at = svg.find(what, at + 1)) ++n;
-    return n;
+  auto count = [&](const char* what) {
+    const std::regex pattern(what);
+    return std::distance(std::sregex_iterator(svg.begin(), svg.end(), pattern), {});
   };
   // Three OCV bands and their spread; for 16 tables, one resistance curve
   // and three bands of temperature coefficients.
-  EXPECT_EQ(count("<polyline"), 3u + 3u + 16u * 4u);
-  EXPECT_EQ(count(">each band minus band 1<"), 1u);
-  EXPECT_EQ(count("temperature band "), 3u);
-  EXPECT_EQ(count(">missing: the daemon refuses the model<"), 1u);
+  EXPECT_EQ(count("<polyline"), 3 + 3 + 16 * 4);
+  EXPECT_EQ(count(">missing: the daemon refuses the model<"), 1);
   EXPECT_EQ(count("<text"), count("</text>"));
 }
 
@@ -253,14 +233,12 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
   std::string report;
   auto field = [&](const std::string& key) {
     std::smatch m;
-    return std::regex_search(report, m, std::regex("(^|\n)" + key + ": +([^\n]*)"))
-               ? m[2].str()
-               : "(no " + key + ")";
+    std::regex_search(report, m, std::regex("(^|\n)" + key + ": +([^\n]*)"));
+    return m[2].str();
   };
   auto verdict = [&] {
     ToolRun run = s.rcmodel({"status"}, "", device.dir().string());
-    EXPECT_EQ(run.status, 0);
-    EXPECT_EQ(run.err, "");
+    EXPECT_TRUE(run.status == 0 && run.err.empty()) << run.err;
     report = run.out;
     return field("verdict");
   };
@@ -270,18 +248,14 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
   EXPECT_EQ(verdict(), "stale") << report;
   const std::string record = field("record SHA-1");
   EXPECT_EQ(field("saved boot session"), "(none)");
-  EXPECT_EQ(field("chem ID"), "0x2168 (8552)");
-  EXPECT_EQ(field("device type"), "T618e");
   EXPECT_EQ(field("model file"), model.string());
   EXPECT_EQ(field("driver's hash"), "(none published)");
-  EXPECT_FALSE(fs::exists(device.dir() / "state"));
-  EXPECT_FALSE(fs::exists(device.dir() / "driver"));
+  EXPECT_FALSE(fs::exists(device.dir() / "state") || fs::exists(device.dir() / "driver"));
 
   runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
                       BatteryModelDataHandler::init().get());
   const std::string uploaded = readWhole(device.dir() / "driver/battery_params.bin");
   const SHA1Digest digest = sha1(uploaded.data(), uploaded.size());
-  ASSERT_EQ(uploaded.size(), 29056u);
   EXPECT_EQ(record, hexString(digest.data(), digest.size()));
   ToolRun built = s.rcmodel({"record", model.string(), "-o", "record.bin"});
   EXPECT_EQ(built.out, record + "\n") << built.err;

@@ -71,15 +71,12 @@ class Scratch {
                                        fd == 0 ? O_RDONLY : O_WRONLY | O_CREAT | O_TRUNC, 0644);
     posix_spawn_file_actions_addchdir_np(&actions, dir_.c_str());
     pid_t pid = -1;
-    int status = 0;
-    ToolRun run;
+    int status = 0, code = -1;
     if (posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), env.envp()) == 0 &&
         waitpid(pid, &status, 0) == pid)
-      run.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+      code = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
     posix_spawn_file_actions_destroy(&actions);
-    run.out = readWhole(files[1]);
-    run.err = readWhole(files[2]);
-    return run;
+    return {code, readWhole(files[1]), readWhole(files[2])};
   }
 
  private:
