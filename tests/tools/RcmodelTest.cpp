@@ -117,10 +117,11 @@ TEST_F(Rcmodel, ExitCodesAndMessages) {
 }
 
 // Every command that writes treats its output path alike: "-" and a link to
-// /proc/self/fd/1 are standard output; a symlink, dangling or not, is written through and
-// stays a link; the file it ends at is replaced by a new one with the old
-// mode; a FIFO is written in place for its reader; a directory is refused; and
-// a file that cannot be replaced keeps its old content while one line says why.
+// /proc/self/fd/1 are standard output; a symlink, dangling or not, is written
+// through and stays a link; the file it ends at is replaced by a new one with
+// the old mode; a FIFO is written in place for its reader; a directory is
+// refused; and a file that cannot be replaced keeps its old content while one
+// line says why.
 TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
   fs::permissions(s / ".", fs::perms(0755));
   writeWhole(s / "m.json", "{\"chemID\": 8552}");
