@@ -3,169 +3,155 @@
 // and wrong JSON is refused with the path of the first wrong value.
 #include <gtest/gtest.h>
 
-#include <charconv>
+#include <bit>
+#include <cfloat>
+#include <limits>
+#include <random>
 
 #include "model/OTAParamRC.h"
-#include "tests/tools/RandomModel.h"
+#include "tools/example_models/ExampleModel.h"
 #include "tools/rcmodel/ModelJSON.h"
 
 namespace kolvrand {
 namespace {
 
-using rcmodel::floatJSON;
 using rcmodel::JSONError;
 using rcmodel::modelsFromJSON;
 using rcmodel::renderJSON;
+constexpr float kInf = std::numeric_limits<float>::infinity();
+constexpr float kNaN = std::numeric_limits<float>::quiet_NaN();
+constexpr float kTiny = std::numeric_limits<float>::denorm_min();
 
-uint32_t bits(float f) {
-  return std::bit_cast<uint32_t>(f);
-}
+// Random models in their dictionary form, reproducible from a seed. Their
+// shape (which keys, and of which kind) is taken from a full example model's
+// dictionary, so every field is exercised without the test listing them.
+struct RandomModels {
+  std::mt19937_64 rng;
+  const Value shape = makeExampleModel(0x2168)->dictionaryRepresentation();
+
+  size_t pick(size_t n) { return static_cast<size_t>(rng() % n); }
+
+  // A float of any kind; NaN only as the one quiet NaN, since JSON's "NaN"
+  // carries neither sign nor payload.
+  float randomFloat() {
+    static const float kSpecial[] = {0.0f,  -0.0f,       kInf,       -kInf,   kNaN,
+                                     kTiny, -kTiny,      FLT_MIN,    FLT_MAX, -FLT_MAX,
+                                     0.1f,  1.0f / 3.0f, 16777216.0f};
+    const size_t kind = pick(10);
+    if (kind == 0) return kSpecial[pick(std::size(kSpecial))];
+    if (kind >= 5) return std::uniform_real_distribution<float>(-5.0f, 5.0f)(rng);
+    const float f = std::bit_cast<float>(static_cast<uint32_t>(rng()));
+    return f != f ? kNaN : f;
+  }
+
+  // A dictionary like `shape`: every list (some empty), some sub-messages,
+  // optional values and the enum left out.
+  Value like(const Value& shape) {
+    const Dictionary* d = shape.asDictionary();
+    if (!d) return shape;
+    Dictionary out;
+    for (const auto& [key, value] : *d) {
+      if (value.isArray()) {
+        Array list(pick(5) == 0 ? 0 : pick(24));
+        for (Value& v : list) v = Number::fromFloat(randomFloat());
+        out.set(key, std::move(list));
+      } else if (value.isDictionary()) {
+        if (pick(10) < 7) out.set(key, like(value));
+      } else if (value.asNumber() && value.asNumber()->kind() == Number::Kind::Unsigned) {
+        out.set(key, Number::fromUnsigned(static_cast<uint32_t>(rng())));
+      } else if (value.isNumber()) {
+        if (pick(10) < 6) out.set(key, Number::fromFloat(randomFloat()));
+      } else if (value.isString() && pick(10) < 6) {
+        // The two named values or any other, which shows as "(unknown: N)".
+        const int32_t v = static_cast<int32_t>(pick(3) < 2 ? pick(2) : rng());
+        out.set(key, OTAParamRC::mLBConfigAsString(v));
+      }
+    }
+    return out;
+  }
+};
 
 TEST(ModelJSON, RandomModelsRoundTrip) {
-  test::RandomModels random(20261122);
+  RandomModels random{std::mt19937_64(20261122)};
   for (int i = 0; i < 300; ++i) {
-    SCOPED_TRACE(i);
-    const Value dictionary = random.next();
+    const Value dictionary = random.like(random.shape);
     const std::string json = renderJSON(dictionary);
 
-    // The import is the exact reverse of the dictionary form.
-    DictionaryError why;
-    auto model = OTAParamRC::fromDictionary(dictionary, &why);
-    ASSERT_TRUE(model) << why.path << ": " << why.reason;
-    EXPECT_TRUE(model->dictionaryRepresentation() == dictionary) << json;
-
-    // JSON -> message -> wire -> message -> JSON gives the same text, and the
-    // message read from JSON encodes to the same bytes.
+    // The model read from the JSON has the very dictionary it came from: the
+    // import is the exact reverse of the dictionary form, and every float
+    // written reads back to the same bits.
     JSONError error;
-    auto fromJSON = modelsFromJSON(json, true, &error);
-    ASSERT_TRUE(fromJSON) << error.message();
-    const std::vector<uint8_t> wire = (*fromJSON)[0]->data();
-    EXPECT_EQ(wire, model->data());
-    OTAParamRC decoded;
-    PBDataReader reader(wire.data(), wire.size());
-    ASSERT_TRUE(decoded.readFrom(reader));
-    EXPECT_EQ(renderJSON(decoded.dictionaryRepresentation()), json);
+    auto models = modelsFromJSON(json, true, &error);
+    ASSERT_TRUE(models) << error.message();
+    EXPECT_TRUE((*models)[0]->dictionaryRepresentation() == dictionary) << json;
   }
 }
 
-TEST(ModelJSON, FloatsAreTheShortestTextThatReadsBack) {
-  const std::pair<float, const char*> cases[] = {
-      {0.1f, "0.1"},
-      {1.0f, "1"},
-      {-0.0f, "-0.0"},  // "-0" would read back as the integer 0
-      {16777216.0f, "16777216"},
-      {std::numeric_limits<float>::denorm_min(), "1e-45"},
-      {FLT_MAX, "3.4028235e+38"},
-      {std::numeric_limits<float>::quiet_NaN(), "\"NaN\""},
-      {std::numeric_limits<float>::infinity(), "\"Infinity\""},
-      {-std::numeric_limits<float>::infinity(), "\"-Infinity\""},
-  };
-  for (const auto& [value, text] : cases) EXPECT_EQ(floatJSON(value), text);
-
-  test::RandomModels random(7);
-  for (int i = 0; i < 20000; ++i) {
-    const float f = random.randomFloat();
-    auto value = rcmodel::parseJSON(floatJSON(f), nullptr);
-    ASSERT_TRUE(value && value->isNumber()) << floatJSON(f);
-    EXPECT_EQ(bits(value->asNumber()->floatValue()), bits(f)) << floatJSON(f);
-  }
-}
-
-TEST(ModelJSON, NumbersRoundToTheNearestFloatOnce) {
-  struct Case {
-    const char* json;
-    float expected;
-  } const cases[] = {
-      {"[0.1]", 0.1f},
-      {"[3]", 3.0f},
-      {"[16777217]", 16777216.0f},
-      {"[1e-50]", 0.0f},
-      {"[3.4028235e38]", FLT_MAX},
-      {"[1.00000005960464477539062499]", 1.0f},  // just below the midpoint to the next float
-      {"[1.00000005960464477539062501]", 1.00000011920928955078125f},  // just above it
-  };
-  for (const Case& c : cases) {
-    Value wrapped = Dictionary{{"gridOCV", *rcmodel::parseJSON(c.json, nullptr)}};
-    DictionaryError why;
-    auto model = OTAParamRC::fromDictionary(wrapped, &why);
-    ASSERT_TRUE(model) << c.json << ": " << why.reason;
-    ASSERT_EQ(model->gridOCVsCount(), 1u);
-    EXPECT_EQ(bits(model->gridOCVAtIndex(0)), bits(c.expected)) << c.json;
-  }
-}
-
-TEST(ModelJSON, EnumTakesNamesTheUnknownFormAndIntegers) {
-  const std::pair<const char*, int32_t> taken[] = {
-      {"\"kKVRRegularMLB\"", 0},
-      {"\"kKVRNorthSouthSplitMLB\"", 1},
-      {"\"(unknown: 7)\"", 7},
-      {"\"(unknown: -2147483648)\"", INT32_MIN},
-      {"5", 5},
-      {"-1", -1},
-      {"2147483647", INT32_MAX},
-  };
-  for (const auto& [json, value] : taken) {
-    JSONError error;
-    auto models = modelsFromJSON(std::string("{\"MLBConfig\":") + json + "}", true, &error);
-    ASSERT_TRUE(models) << json << ": " << error.message();
-    EXPECT_TRUE((*models)[0]->hasMLBConfig());
-    EXPECT_EQ((*models)[0]->mLBConfig(), value) << json;
-  }
-}
-
-TEST(ModelJSON, WrongJSONNamesThePathOfTheFirstWrongValue) {
+// What comes of each JSON text: the model, as decode shows it again (for an
+// empty `path`), or the path of the first wrong value and why.
+TEST(ModelJSON, EachTextGivesItsModelOrThePathOfTheFirstWrongValue) {
   std::string deep = "$";
   for (int i = 0; i < 64; ++i) deep += "[0]";
   struct Case {
-    std::string json;
-    bool single;
-    std::string path;
-    const char* reason;
+    std::string json, path;
+    const char* text;  // found in the model's JSON, or in the reason
+    bool single = false;
   };
   std::vector<Case> cases = {
-      {"{\"R0x\": []}", false, "$.R0x", "unknown key"},
-      {"{\"r0\": {}}", false, "$.r0", "did you mean \"R0\""},
-      {"{\"chemID\": -1}", false, "$.chemID", "-1 is out of range"},
-      {"{\"chemID\": 4294967296}", false, "$.chemID", "out of range"},
-      {"{\"chemID\": 2.5}", false, "$.chemID", "expected an unsigned 32-bit integer"},
-      {"{\"chemID\": \"1\"}", false, "$.chemID", "got the string \"1\""},
-      {"{\"gridOCV\": [1, 2, \"x\"]}", false, "$.gridOCV[2]", "expected a float"},
-      {"{\"gridOCV\": [1e39]}", false, "$.gridOCV[0]", "out of range for a 32-bit float"},
-      {"{\"gridOCV\": 1}", false, "$.gridOCV", "expected an array of floats"},
-      {"{\"maxRdcRatio\": [1]}", false, "$.maxRdcRatio", "expected a float, got an array"},
-      {"{\"R0\": []}", false, "$.R0", "expected an object (OTAResistanceData)"},
-      {"{\"R0\": {\"resistance25C\": [0, null]}}", false, "$.R0.resistance25C[1]", "null"},
-      {"[{}, {\"bmuResistance\": {\"bogus\": 1}}]", false, "$[1].bmuResistance.bogus",
-       "unknown key"},
-      {"[{}, 3]", false, "$[1]", "expected an object"},
-      {"[{}]", true, "$", "expected one object"},
-      {"{\"chemID\": 1, \"chemID\": 2}", false, "$.chemID", "twice"},
-      {"{\"chemID\": 1", false, "$", "not valid JSON"},
-      {"{} {}", false, "$", "not valid JSON"},
-      {"", false, "$", "not valid JSON"},
-      {std::string(100000, '[') + std::string(100000, ']'), false, deep, "nested deeper than 64"},
+      // Floats are the shortest text that reads back ("-0" would read back as
+      // the integer 0) and numbers round to the nearest float once: the last
+      // two just below and above the midpoint between 1 and the next float.
+      {"{\"gridOCV\":[0.1, 1.0, -0.0, 1e-45, \"NaN\", \"Infinity\", \"-Infinity\", 3.4028235e38]}",
+       "", "\"gridOCV\":[0.1,1,-0.0,1e-45,\"NaN\",\"Infinity\",\"-Infinity\",3.4028235e+38]"},
+      {"{\"gridOCV\":[3, 16777217, 1e-50, 1.00000005960464477539062499, "
+       "1.00000005960464477539062501]}",
+       "", "\"gridOCV\":[3,16777216,0,1,1.0000001]"},
+      // The enum takes its names, the unknown form and integers.
+      {"{\"MLBConfig\":\"kKVRNorthSouthSplitMLB\"}", "", ":\"kKVRNorthSouthSplitMLB\""},
+      {"{\"MLBConfig\":\"(unknown: -2147483648)\"}", "", ":\"(unknown: -2147483648)\""},
+      {"{\"MLBConfig\":-1}", "", "\"MLBConfig\":\"(unknown: -1)\""},
+      {"{\"MLBConfig\":2147483647}", "", "\"MLBConfig\":\"(unknown: 2147483647)\""},
+      {"{\"R0x\": []}", "$.R0x", "unknown key"},
+      {"{\"r0\": {}}", "$.r0", "did you mean \"R0\""},
+      // A number beyond its field's range is shown as it was written.
+      {"{\"chemID\": -1}", "$.chemID", "-1 is out of range"},
+      {"{\"chemID\": 4294967296}", "$.chemID", "4294967296 is out of range"},
+      {"{}\n{\"gridOCV\": [1, 1E39]}", "line 2: $.gridOCV[1]", "1E39 is out of range for a 32-bit"},
+      {"{\"chemID\": 2.5}", "$.chemID", "expected an unsigned 32-bit integer"},
+      {"{\"chemID\": \"1\"}", "$.chemID", "got the string \"1\""},
+      {"{\"gridOCV\": 1}", "$.gridOCV", "expected an array of floats"},
+      {"{\"maxRdcRatio\": [1]}", "$.maxRdcRatio", "expected a float, got an array"},
+      {"{\"R0\": []}", "$.R0", "expected an object (OTAResistanceData)"},
+      {"{\"R0\": {\"resistance25C\": [0, null]}}", "$.R0.resistance25C[1]", "null"},
+      {"[{}, {\"bmuResistance\": {\"bogus\": 1}}]", "$[1].bmuResistance.bogus", "unknown key"},
+      {"[{}, 3]", "$[1]", "expected an object"},
+      {"{}\n[]", "line 2: $", "expected an object (one model) on each line"},
+      {"[]", "$", "holds no model"},
+      {"[{}]", "$", "expected one object", true},
+      {"{}\n{}\n", "$", "got line 2 after it", true},
+      {"{\"chemID\": 1, \"chemID\": 2}", "$.chemID", "twice"},
+      {"", "$", "not valid JSON"},
+      // Nothing may follow the JSON, not even behind a NUL byte; syntax errors
+      // name their line and column in the whole text.
+      {std::string("{}\n\0{\"chemID\": 1}", 16), "$", "a NUL byte at line 2, column 1"},
+      {"{} x", "$", "at line 1, column 4: syntax error"},
+      {"{}\n{}\n\n{\"chemID\": x}\n", "$", "at line 4, column 12: syntax error"},
+      {std::string(100000, '[') + std::string(100000, ']'), deep, "nested deeper than 64"},
   };
   // Of an enum, only the text the dictionary would show for a value is taken.
   for (const char* json : {"\"(unknown: 0)\"", "\"(unknown: 07)\"", "\"(unknown: 2147483648)\"",
                            "\"(unknown: )\"", "\"kkvrregularmlb\"", "2147483648", "1.5", "true"})
-    cases.push_back({std::string("{\"MLBConfig\":") + json + "}", false, "$.MLBConfig", ""});
+    cases.push_back({std::string("{\"MLBConfig\":") + json + "}", "$.MLBConfig", ""});
   for (const Case& c : cases) {
     JSONError error;
+    auto models = modelsFromJSON(c.json, c.single, &error);
     const std::string shown = c.json.substr(0, 80);
-    EXPECT_FALSE(modelsFromJSON(c.json, c.single, &error)) << shown;
-    EXPECT_EQ(error.path, c.path) << shown;
-    EXPECT_NE(error.reason.find(c.reason), std::string::npos) << shown << " -> " << error.reason;
+    ASSERT_EQ(!models, !c.path.empty()) << shown << " -> " << error.message();
+    const std::string text =
+        models ? renderJSON((*models)[0]->dictionaryRepresentation()) : error.reason;
+    EXPECT_EQ(models ? "" : error.path, c.path) << shown;
+    EXPECT_NE(text.find(c.text), std::string::npos) << shown << " -> " << text;
   }
-}
-
-TEST(ModelJSON, KeysLeftOutLeaveTheirFieldsAlone) {
-  auto model = makeExampleModel(0x2168);
-  const std::vector<uint8_t> before = model->data();
-  DictionaryError why;
-  ASSERT_TRUE(model->setFieldsFromDictionary(Dictionary{{"chemID", Number::fromSigned(5)}}, &why));
-  EXPECT_EQ(model->chemID(), 5u);
-  model->setChemID(0x2168);
-  EXPECT_EQ(model->data(), before);
 }
 
 }  // namespace

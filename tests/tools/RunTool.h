@@ -5,7 +5,6 @@
 #include <fcntl.h>
 #include <spawn.h>
 #include <sys/wait.h>
-#include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
@@ -13,13 +12,9 @@
 #include <string>
 #include <vector>
 
-extern char** environ;
+#include "tests/support/DaemonEnvironment.h"
 
 namespace kolvrand::test {
-
-inline std::filesystem::path rcmodelBinary() {
-  return std::filesystem::path(KOLVRAND_BINARY_DIR) / "tools" / "rcmodel" / "rcmodel";
-}
 
 inline std::string readWhole(const std::filesystem::path& path) {
   std::ifstream in(path, std::ios::binary);
@@ -50,54 +45,37 @@ class Scratch {
   Scratch(const Scratch&) = delete;
   Scratch& operator=(const Scratch&) = delete;
 
-  const std::filesystem::path& dir() const { return dir_; }
-  // A command that runs rcmodel in its place (its first word an absolute
-  // path), such as setpriv to drop root's privileges.
-  std::vector<std::string> launcher;
   std::filesystem::path operator/(const std::string& name) const { return dir_ / name; }
 
-  // rcmodel ARGS in this directory, with `input` on stdin. KOLVRAND_DEVICE
-  // is set to `device` when given and removed otherwise.
+  // rcmodel ARGS in this directory, with `input` on stdin, on the simulated
+  // device `device` (by default this directory, which holds none, so that no
+  // run reaches the host's state). `launcher`, when given, is a command that
+  // runs rcmodel in its place (its first word an absolute path), such as
+  // setpriv to drop root's privileges.
   ToolRun rcmodel(const std::vector<std::string>& args, const std::string& input = "",
-                  const std::string& device = "") const {
-    writeWhole(dir_ / ".stdin", input);
-    std::vector<std::string> env;
-    for (char** e = environ; *e; ++e) {
-      std::string_view v(*e);
-      if (!v.starts_with("KOLVRAND_") && !v.starts_with("STATE_DIRECTORY=")) env.emplace_back(v);
-    }
-    if (!device.empty()) env.push_back("KOLVRAND_DEVICE=" + device);
-    std::vector<char*> envp;
-    for (auto& s : env) envp.push_back(s.data());
-    envp.push_back(nullptr);
-
-    std::string binary = rcmodelBinary().string();
-    std::vector<std::string> argStrings = launcher;
-    argStrings.push_back(binary);
-    argStrings.insert(argStrings.end(), args.begin(), args.end());
+                  const std::string& device = "", std::vector<std::string> launcher = {}) const {
+    const std::string files[] = {dir_ / ".stdin", dir_ / ".stdout", dir_ / ".stderr"};
+    writeWhole(files[0], input);
+    const DaemonEnvironment env(device.empty() ? dir_ : std::filesystem::path(device), {});
+    launcher.push_back(std::string(KOLVRAND_BINARY_DIR) + "/tools/rcmodel/rcmodel");
+    launcher.insert(launcher.end(), args.begin(), args.end());
     std::vector<char*> argv;
-    for (auto& s : argStrings) argv.push_back(s.data());
+    for (auto& s : launcher) argv.push_back(s.data());
     argv.push_back(nullptr);
 
-    const std::string in = (dir_ / ".stdin").string(), out = (dir_ / ".stdout").string(),
-                      err = (dir_ / ".stderr").string();
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, 0, in.c_str(), O_RDONLY, 0);
-    posix_spawn_file_actions_addopen(&actions, 1, out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-    posix_spawn_file_actions_addopen(&actions, 2, err.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+    for (int fd = 0; fd < 3; ++fd)
+      posix_spawn_file_actions_addopen(&actions, fd, files[fd].c_str(),
+                                       fd == 0 ? O_RDONLY : O_WRONLY | O_CREAT | O_TRUNC, 0644);
     posix_spawn_file_actions_addchdir_np(&actions, dir_.c_str());
-    ToolRun run;
     pid_t pid = -1;
-    if (posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), envp.data()) == 0) {
-      int status = 0;
-      waitpid(pid, &status, 0);
-      run.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-    }
+    int status = 0, code = -1;
+    if (posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), env.envp()) == 0 &&
+        waitpid(pid, &status, 0) == pid)
+      code = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
     posix_spawn_file_actions_destroy(&actions);
-    run.out = readWhole(out);
-    run.err = readWhole(err);
-    return run;
+    return {code, readWhole(files[1]), readWhole(files[2])};
   }
 
  private:
