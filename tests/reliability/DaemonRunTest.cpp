@@ -175,6 +175,9 @@ const std::string kAsEmpty = " is not a JSON object; reading it as empty";
 // What the case does to the device, how the run ends, and part of a line of
 // the run ("@" stands for the model file's path).
 using Case = std::tuple<const char*, Arrange, Outcome, std::string>;
+void PrintTo(const Case& c, std::ostream* os) {
+  *os << std::get<0>(c);
+}
 const Case kCases[] = {
     {"a directory", notAFile([](const fs::path& p) { fs::create_directory(p); }), Outcome::Failed,
      "not a regular file"},
