@@ -13,7 +13,6 @@
 namespace kolvrand {
 namespace {
 
-namespace fs = std::filesystem;
 using Lines = std::vector<std::string>;
 using nlohmann::json;
 
@@ -25,12 +24,12 @@ const std::string kSuffix =
     "-[BatteryModelDataHandler getSpecialCaseBatteryModelIdentifier:] <Error> ";
 
 // The chem ID with its one replacement, stored as read; and the serial-number
-// suffix, which only chem ID 5640 has. Null battery data takes the battery
+// suffix of the model file's name, which only chem ID 5640 has. Null battery data takes the battery
 // driver away, "absent" only its data.
 TEST(BatteryIdentity, ChemIDAndSerialNumberSuffix) {
   const char* const kChem = "AlgoChemID";
   const char* const kSerial = "BatterySerialNumber";
-  // battery data, chem ID, suffix of chem ID 5640, lines
+  // battery data, chem ID, the suffix of chem ID 5640's model file, lines
   const std::tuple<json, uint32_t, std::string, Lines> cases[] = {
       {{{kChem, 6439}, {kSerial, "0123456789ABCDE8"}}, 8552, "b", {}},
       {{{kChem, 8552}, {kSerial, "0123456789ABCDE8Z"}}, 8552, "b", {}},
@@ -58,7 +57,9 @@ TEST(BatteryIdentity, ChemIDAndSerialNumberSuffix) {
     test::TestDevice testDevice(device);
     auto handler = BatteryModelDataHandler::init();
     EXPECT_EQ(handler->getBatteryChemID(), chemID);
-    EXPECT_EQ(handler->getSpecialCaseBatteryModelIdentifier(5640), suffix);
+    EXPECT_EQ(
+        handler->getBatteryModelFilePath(5640),
+        (testDevice.dir() / "Library/KVR/BatteryModels/R72/1608").string() + suffix + ".rcmodel");
     // Any other chem ID never looks at the registry.
     EXPECT_EQ(handler->getSpecialCaseBatteryModelIdentifier(5641), "");
     EXPECT_EQ(testDevice.logLines(), lines);
@@ -107,10 +108,10 @@ TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
     for (auto [chemID, type] : rows) EXPECT_EQ(handler->getDeviceType(chemID), type) << chemID;
     EXPECT_EQ(device.logLines(), Lines{});
     // A model where the path leads is found only if the device type names it.
-    const fs::path models = device.dir() / "Library/KVR/BatteryModels";
     EXPECT_EQ(handler->getBatteryModelFileURLString(0x1234), std::nullopt);
     if (!result) continue;
-    const std::string path = models.string() + "/" + *result + "/1234.rcmodel";
+    const std::string path =
+        (device.dir() / "Library/KVR/BatteryModels/").string() + *result + "/1234.rcmodel";
     device.installModel(*result + "/1234.rcmodel", "");
     EXPECT_EQ(handler->getBatteryModelFileURLString(0x1234),
               namesFile ? std::optional(path) : std::nullopt);

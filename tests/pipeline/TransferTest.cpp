@@ -30,7 +30,9 @@ std::string contents(const fs::path& path) {
 // transfer_chains.json: per case the lines, the device.json patch, what the
 // driver publishes as "KVRVector" when the case says (null: the driver's
 // "none"; left out, the simulated driver publishes the hash of what it holds),
-// and the model file at T618e/2168.rcmodel. "@" stands for its full path.
+// and the model file at T618e/2168.rcmodel. "@" stands for its full path. The
+// hashes there are made from the example record's SHA-1, which
+// ExampleModelBytesTest pins.
 TEST(Transfer, EachOutcomeLeavesItsChainTheDriverAndTheMark) {
   const auto model = makeExampleModel(0x2168);
   const std::string example = test::modelFile({model});
