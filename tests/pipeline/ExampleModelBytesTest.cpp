@@ -18,13 +18,8 @@
 namespace kolvrand {
 namespace {
 
-struct Example {
-  const char* file;
-  uint32_t chemID;
-  const char* recordSHA1;
-};
-
-constexpr Example kExamples[] = {
+// File, chem ID, SHA-1 of the record.
+constexpr std::tuple<const char*, uint32_t, const char*> kExamples[] = {
     {"examples/models/K517/1821.rcmodel", 0x1821, "83b8e6fb91ab8c06e267bb8bed872113b25a5fa9"},
     {"examples/models/R70/1552.rcmodel", 0x1552, "82e31811550188d291511afceeabad1880f62221"},
     {"examples/models/R71/1532.rcmodel", 0x1532, "e43e002abc201d5b3b81e6a19e330ad863e8391b"},
@@ -39,14 +34,14 @@ constexpr Example kExamples[] = {
 TEST(ExampleModels, EncodeAgainToTheirFileAndGiveRecordsOfTheirFixedDigests) {
   test::TestDevice device;
   auto handler = BatteryModelDataHandler::init();
-  for (const Example& e : kExamples) {
-    SCOPED_TRACE(e.file);
+  for (const auto& [name, chemID, recordSHA1] : kExamples) {
+    SCOPED_TRACE(name);
     NSError error;
-    auto file = PBStreamReader::readFile(std::string(KOLVRAND_SOURCE_DIR) + "/" + e.file, &error);
+    auto file = PBStreamReader::readFile(std::string(KOLVRAND_SOURCE_DIR) + "/" + name, &error);
     ASSERT_TRUE(file) << error.description();
     auto models = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(*file, &error);
     ASSERT_TRUE(models && models->size() == 1) << error.description();
-    EXPECT_EQ(models->front()->chemID(), e.chemID);
+    EXPECT_EQ(models->front()->chemID(), chemID);
     EXPECT_EQ(
         PBStreamWriter::dataForMessages(std::span<const std::shared_ptr<OTAParamRC>>(*models)),
         *file);
@@ -54,10 +49,10 @@ TEST(ExampleModels, EncodeAgainToTheirFileAndGiveRecordsOfTheirFixedDigests) {
     ASSERT_TRUE(record);
     const auto* bytes = reinterpret_cast<const uint8_t*>(record.get());
     // The chem ID leads the record, least significant byte first.
-    EXPECT_EQ(bytes[0], e.chemID & 0xff);
-    EXPECT_EQ(bytes[1], e.chemID >> 8);
+    EXPECT_EQ(bytes[0], chemID & 0xff);
+    EXPECT_EQ(bytes[1], chemID >> 8);
     const SHA1Digest digest = sha1(bytes, kKextBatteryModelSize);
-    EXPECT_EQ(hexString(digest.data(), digest.size()), e.recordSHA1);
+    EXPECT_EQ(hexString(digest.data(), digest.size()), recordSHA1);
   }
 }
 

@@ -1,8 +1,7 @@
-// Finding and reading the model file: device type, path rules, and the stream
-// reader's refusals.
+// Which model file the battery gets and how it is read: the battery's identity
+// from the battery driver's registry data, the device type, the path rules and
+// the stream reader's refusals.
 #include <gtest/gtest.h>
-
-#include <fstream>
 
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
@@ -14,14 +13,64 @@
 namespace kolvrand {
 namespace {
 
-namespace fs = std::filesystem;
 using Lines = std::vector<std::string>;
 using nlohmann::json;
 
 const std::string kHandler = "[batteryModelDataHandling] ";
+const std::string kInt =
+    "error " + kHandler + "-[BatteryModelDataHandler getIntValueForKeyFromBatteryData:] <Error> ";
+const std::string kSuffix =
+    "error " + kHandler +
+    "-[BatteryModelDataHandler getSpecialCaseBatteryModelIdentifier:] <Error> ";
+
+// The chem ID with its one replacement, stored as read; and the serial-number
+// suffix of the model file's name, which only chem ID 5640 has. Null battery data takes the battery
+// driver away, "absent" only its data.
+TEST(BatteryIdentity, ChemIDAndSerialNumberSuffix) {
+  const char* const kChem = "AlgoChemID";
+  const char* const kSerial = "BatterySerialNumber";
+  // battery data, chem ID, the suffix of chem ID 5640's model file, lines
+  const std::tuple<json, uint32_t, std::string, Lines> cases[] = {
+      {{{kChem, 6439}, {kSerial, "0123456789ABCDE8"}}, 8552, "b", {}},
+      {{{kChem, 8552}, {kSerial, "0123456789ABCDE8Z"}}, 8552, "b", {}},
+      {{{kChem, 6440}, {kSerial, "0123456789ABCDE7"}}, 6440, "a", {}},
+      {{{kChem, 0}, {kSerial, "0123456789ABCD8"}}, 0, "a", {}},
+      {{{kChem, -1}, {kSerial, ""}}, 0xFFFFFFFF, "a", {}},
+      // A value wider than 32 bits keeps its low 32 bits, 6439, read as 8552;
+      // 18 bytes do not fit with their NUL: read as no serial number at all.
+      {{{kChem, 0x100001927LL}, {kSerial, "0123456789ABCDE8ZZ"}}, 8552, "a", {}},
+      // Sixteen bytes whose last is the second byte of a two-byte character.
+      {{{kChem, "6439"}, {kSerial, "0123456789ABCD\xc3\xa8"}}, 0, "a", {kInt + "valueCF null"}},
+      {{{kChem, 5640}}, 5640, "", {kSuffix + "valueCF null"}},
+      {{{kSerial, 8}}, 0, "", {kInt + "valueCF null", kSuffix + "valueCF null"}},
+      {"absent", 0, "", {kInt + "batteryData null", kSuffix + "batteryData null"}},
+      {{1, 2}, 0, "", {kInt + "batteryData null", kSuffix + "batteryData null"}},
+      {nullptr, 0, "", {kInt + "powerService null", kSuffix + "powerService null"}},
+  };
+  for (const auto& [batteryData, chemID, suffix, lines] : cases) {
+    SCOPED_TRACE(batteryData.dump());
+    json device = test::defaultDeviceJSON();
+    auto& battery = device["registry"]["TesvarSmartBattery"];
+    battery["BatteryData"] = batteryData;
+    if (batteryData == "absent") battery.erase("BatteryData");
+    if (batteryData.is_null()) device["registry"].erase("TesvarSmartBattery");
+    test::TestDevice testDevice(device);
+    auto handler = BatteryModelDataHandler::init();
+    EXPECT_EQ(handler->getBatteryChemID(), chemID);
+    EXPECT_EQ(
+        handler->getBatteryModelFilePath(5640),
+        (testDevice.dir() / "Library/KVR/BatteryModels/R72/1608").string() + suffix + ".rcmodel");
+    // Any other chem ID never looks at the registry.
+    EXPECT_EQ(handler->getSpecialCaseBatteryModelIdentifier(5641), "");
+    EXPECT_EQ(testDevice.logLines(), lines);
+    EXPECT_EQ(testDevice.state()["savedChemID"], chemID);
+  }
+}
 
 // Chem IDs of the table never query the kernel; others fall back to the
-// target type.
+// target type, and a target type that cannot be read is none. The model file
+// lies in a directory of the device type's name; one that is no directory
+// name names no file, whatever lies where it points.
 TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
   const std::pair<uint32_t, const char*> rows[] = {
       {5426, "R71"},   {5458, "R70"},  {5638, "R70"},   {5639, "R72"},   {5640, "R72"},
@@ -29,104 +78,54 @@ TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
       {6249, "K517"},  {6259, "K517"}, {6278, "T604"},  {6408, "T618e"}, {6436, "T618e"},
       {6439, "T618e"}, {6489, "T604"}, {8552, "T618e"},
   };
-  struct Case {
-    json targetType;  // null: absent
-    std::optional<std::string> result;
-    Lines lines;
-  };
-  const Case cases[] = {
-      {"J42", "J42", {"debug " + kHandler + "Read HW type J42"}},
-      {{{"$data", "4a343200"}}, "J42", {"debug " + kHandler + "Read HW type J42"}},
+  const std::tuple<json, std::optional<std::string>, std::string, bool> cases[] = {
+      // target type, device type, line, whether it names a file
+      {"J42", "J42", "debug " + kHandler + "Read HW type J42", true},
+      {{{"$data", "4a343200"}}, "J42", "debug " + kHandler + "Read HW type J42", true},
       // Raw bytes without a NUL still end at the value's size.
-      {{{"$data", "4a3432"}}, "J42", {"debug " + kHandler + "Read HW type J42"}},
-      {{{"$data", "4aff00"}}, std::nullopt, {"debug " + kHandler + "Read HW type J\xff"}},
-      {nullptr,
-       std::nullopt,
-       {"error " + kHandler + "hw.targettype size could not be read. Returned err -1"}},
+      {{{"$data", "4a3432"}}, "J42", "debug " + kHandler + "Read HW type J42", true},
+      {"..", "..", "debug " + kHandler + "Read HW type ..", false},
+      {"a/b", "a/b", "debug " + kHandler + "Read HW type a/b", false},
+      {{{"$data", "4aff00"}}, std::nullopt, "debug " + kHandler + "Read HW type J\xff", false},
+      {nullptr, std::nullopt,
+       "error " + kHandler + "hw.targettype size could not be read. Returned err -1", false},
       // A size no target type has fails as a read does, never by throwing.
-      {std::string(kMaxKernelStringSize + 1, 'J'),
-       std::nullopt,
-       {"error " + kHandler + "Failed to read hw.targettype. Returned err -1"}},
+      {std::string(kMaxKernelStringSize + 1, 'J'), std::nullopt,
+       "error " + kHandler + "Failed to read hw.targettype. Returned err -1", false},
   };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.targetType.dump());
+  for (const auto& [targetType, result, line, namesFile] : cases) {
+    SCOPED_TRACE(targetType.dump());
     json j = test::defaultDeviceJSON();
-    j.merge_patch({{"sysctl", {{"hw.targettype", c.targetType}}}});
+    j.merge_patch({{"sysctl", {{"hw.targettype", targetType}}}});
     test::TestDevice device(j);
     auto handler = BatteryModelDataHandler::init();
     for (uint32_t chemID : {0u, 5637u, 5650u, 5688u, 5690u, 6200u, 6440u}) {
       device.clearLog();
-      EXPECT_EQ(handler->getDeviceType(chemID), c.result) << chemID;
-      EXPECT_EQ(device.logLines(), c.lines) << chemID;
+      EXPECT_EQ(handler->getDeviceType(chemID), result) << chemID;
+      EXPECT_EQ(device.logLines(), Lines{line}) << chemID;
     }
     device.clearLog();
     for (auto [chemID, type] : rows) EXPECT_EQ(handler->getDeviceType(chemID), type) << chemID;
     EXPECT_EQ(device.logLines(), Lines{});
+    // A model where the path leads is found only if the device type names it.
+    EXPECT_EQ(handler->getBatteryModelFileURLString(0x1234), std::nullopt);
+    if (!result) continue;
+    const std::string path =
+        (device.dir() / "Library/KVR/BatteryModels/").string() + *result + "/1234.rcmodel";
+    device.installModel(*result + "/1234.rcmodel", "");
+    EXPECT_EQ(handler->getBatteryModelFileURLString(0x1234),
+              namesFile ? std::optional(path) : std::nullopt);
   }
-}
-
-TEST(DeviceType, KernelStringBufferOfAnySizeIsAllocatedOrRefused) {
   EXPECT_TRUE(allocateKernelStringBuffer(0));
   EXPECT_TRUE(allocateKernelStringBuffer(kMaxKernelStringSize));
-  EXPECT_FALSE(allocateKernelStringBuffer(kMaxKernelStringSize + 1));
   EXPECT_FALSE(allocateKernelStringBuffer(SIZE_MAX));  // size + 1 would wrap
-}
-
-TEST(ModelFilePath, DeviceTypeChemIDAndSuffixNameTheFile) {
-  struct Case {
-    json batteryData;
-    std::string relative;
-  };
-  const Case cases[] = {
-      {{{"AlgoChemID", 6439}}, "T618e/2168.rcmodel"},
-      {{{"AlgoChemID", 5640}, {"BatterySerialNumber", "0123456789ABCDE8"}}, "R72/1608b.rcmodel"},
-      {{{"AlgoChemID", 5640}, {"BatterySerialNumber", "0123456789ABCDE1"}}, "R72/1608a.rcmodel"},
-      {{{"AlgoChemID", 5640}}, "R72/1608.rcmodel"},
-      {{{"AlgoChemID", 1234}}, "T618e/4d2.rcmodel"},  // from hw.targettype
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.relative);
-    json j = test::defaultDeviceJSON();
-    j["registry"]["TesvarSmartBattery"]["BatteryData"] = c.batteryData;
-    test::TestDevice device(j);
-    auto handler = BatteryModelDataHandler::init();
-    uint32_t chemID = handler->getBatteryChemID();
-    EXPECT_EQ(handler->getBatteryModelFileURLString(chemID), std::nullopt);
-    device.installModel(c.relative, "");
-    EXPECT_EQ(handler->getBatteryModelFileURLString(chemID),
-              (device.dir() / "Library/KVR/BatteryModels" / c.relative).string());
-  }
-}
-
-TEST(ModelFile, OnlyTheFirstMessageIsUsed) {
-  test::TestDevice device;
-  auto first = std::make_shared<OTAParamRC>();
-  first->setChemID(1);
-  auto second = std::make_shared<OTAParamRC>();
-  second->setChemID(2);
-  device.installModel("T618e/2168.rcmodel", test::modelFile({first, second}));
-  auto handler = BatteryModelDataHandler::init();
-  auto model = handler->loadProtobufModelWithFileName(
-      (device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel").string());
-  ASSERT_TRUE(model);
-  EXPECT_EQ(model->chemID(), 1u);
-  EXPECT_FALSE(handler->loadProtobufModelWithFileName(std::nullopt));
-  EXPECT_EQ(
-      device.logLines(),
-      Lines{"error " + kHandler +
-            "-[BatteryModelDataHandler loadProtobufModelWithFileName:] <Error> fileName nil"});
 }
 
 TEST(PBStreamReader, FramingErrorsSayWhere) {
   auto message = std::make_shared<OTAParamRC>();
   message->setChemID(0x2168);
   const std::string one = test::modelFile({message});
-  struct Case {
-    std::string bytes;
-    std::optional<size_t> count;
-    std::string error;
-  };
-  const Case cases[] = {
+  const std::tuple<std::string, std::optional<size_t>, std::string> cases[] = {
       {"", 0, ""},
       {one, 1, ""},
       {one + one + one, 3, ""},
@@ -134,23 +133,18 @@ TEST(PBStreamReader, FramingErrorsSayWhere) {
       {"\x80", std::nullopt, "the length of message 0 at offset 0 is cut short"},
       {one + "\x81\x80", std::nullopt, "the length of message 1 at offset 5 is cut short"},
       {"\x05\x90\x01", std::nullopt,
-       "message 0 at offset 0 claims 5 bytes but only 2 remain in "
-       "the file"},
+       "message 0 at offset 0 claims 5 bytes but only 2 remain in the file"},
       {std::string("\xff\xff\xff\xff\xff\xff\xff\xff\xff\x7f", 10), std::nullopt,
        "the length of message 0 at offset 0 is not a valid varint"},
       {one + "\x02\x90\x80", std::nullopt, "message 1 at offset 5 could not be decoded"},
   };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(testing::PrintToString(c.bytes));
+  for (const auto& [bytes, count, why] : cases) {
+    SCOPED_TRACE(testing::PrintToString(bytes));
     NSError error;
     auto messages = PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(
-        std::span<const uint8_t>(reinterpret_cast<const uint8_t*>(c.bytes.data()), c.bytes.size()),
-        &error);
-    ASSERT_EQ(messages.has_value(), c.count.has_value());
-    if (messages) {
-      EXPECT_EQ(messages->size(), *c.count);
-    }
-    EXPECT_EQ(error.localizedDescription, c.error);
+        std::span(reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size()), &error);
+    EXPECT_EQ(messages ? std::optional(messages->size()) : std::nullopt, count);
+    EXPECT_EQ(error.localizedDescription, why);
   }
 }
 
