@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <cstdio>
 #include <string>
 #include <thread>
 
@@ -13,10 +14,9 @@
 
 namespace {
 
-void say(std::string line) {
-  line += '\n';
-  ssize_t n = ::write(STDOUT_FILENO, line.data(), line.size());
-  (void)n;
+void say(const std::string& line) {
+  std::puts(line.c_str());
+  std::fflush(stdout);
 }
 
 }  // namespace
