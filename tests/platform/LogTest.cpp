@@ -133,19 +133,20 @@ TEST(Concurrency, LogLinesOfThreadsNeverInterleave) {
   std::multiset<std::string> expected, lines;  // in whatever order the threads ran
   {
     std::vector<std::jthread> threads;
-    for (int t = 0; t < 4; ++t)
+    for (int t = 0; t < 4; ++t) {
+      // A line feed within a message becomes a space: one message, one line.
       threads.emplace_back([&, t] {
         for (int i = 0; i < 200; ++i)
-          os_log(log, "thread %d message %d with some padding to make it longer\n", t, i);
+          os_log(log, "thread %d\nmessage %d with some padding to make it longer\n", t, i);
       });
+      for (int i = 0; i < 200; ++i)
+        expected.insert("kolvrand[" + std::to_string(::getpid()) + "]: default [threads] thread " +
+                        std::to_string(t) + " message " + std::to_string(i) +
+                        " with some padding to make it longer\n");
+    }
   }
   ::dup2(saved, STDERR_FILENO);
   ::close(saved);
-  for (int t = 0; t < 4; ++t)
-    for (int i = 0; i < 200; ++i)
-      expected.insert("kolvrand[" + std::to_string(::getpid()) + "]: default [threads] thread " +
-                      std::to_string(t) + " message " + std::to_string(i) +
-                      " with some padding to make it longer\n");
   std::rewind(file);
   for (char buf[512]; std::fgets(buf, sizeof buf, file);) lines.insert(buf);
   std::fclose(file);
