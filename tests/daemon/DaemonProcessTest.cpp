@@ -1,12 +1,11 @@
-// The real daemon, run on temporary copies of the example device: what it
-// prints on stderr, what it stores, and how it ends.
+// The real daemon, run on simulated devices holding the example models: what
+// it prints on stderr, what it stores, and how it ends.
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <fstream>
-#include <nlohmann/json.hpp>
 
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/TestDevice.h"
 #include "tests/tools/RunTool.h"
 
 namespace kolvrand {
@@ -14,118 +13,80 @@ namespace {
 
 namespace fs = std::filesystem;
 using Lines = std::vector<std::string>;
+using nlohmann::json;
 
-class DeviceCopy {
- public:
-  DeviceCopy() {
-    char pattern[] = "/tmp/kolvrand-e2e.XXXXXX";
-    dir_ = mkdtemp(pattern);
-    fs::copy(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device", dir_, fs::copy_options::recursive);
-    std::ifstream in(dir_ / "device.json");
-    json_ = nlohmann::json::parse(in);
+struct Device : test::TestDevice {
+  Device() {
+    fs::copy(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device/Library", dir() / "Library",
+             fs::copy_options::recursive);
   }
-  ~DeviceCopy() { fs::remove_all(dir_); }
-  const fs::path& dir() const { return dir_; }
-  nlohmann::json& json() { return json_; }
-  void save() const { std::ofstream(dir_ / "device.json") << json_.dump(2); }
-  std::string bootUUID() const { return json_["sysctl"]["kern.bootsessionuuid"]; }
-  nlohmann::json state() const {
-    std::ifstream in(dir_ / "state/com.tesvar.kolvrand.json");
-    return nlohmann::json::parse(in, nullptr, false);
-  }
-
- private:
-  fs::path dir_;
-  nlohmann::json json_;
+  fs::path models() const { return dir() / "Library/KVR/BatteryModels"; }
 };
 
-// The lines of `all` that are in `wanted`, in the order they came.
-Lines only(const Lines& all, const Lines& wanted) {
-  Lines out;
-  std::copy_if(all.begin(), all.end(), std::back_inserter(out), [&](const std::string& l) {
-    return std::find(wanted.begin(), wanted.end(), l) != wanted.end();
-  });
-  return out;
+// Starts the daemon, waits for one of `texts`, stops it with SIGTERM and
+// returns its lines; `before` runs once the text came, `wellFormed` says
+// whether every line had the exact "kolvrand[PID]: " prefix.
+Lines runDaemon(const Device& device, const std::string& levels,
+                std::initializer_list<std::string_view> texts,
+                const std::function<void(test::DaemonProcess&)>& before = {},
+                bool* wellFormed = nullptr) {
+  test::DaemonProcess daemon(device.dir(), levels);
+  EXPECT_TRUE(daemon.waitForLine(texts)) << daemon.rawStderr();
+  if (before) before(daemon);
+  daemon.signal(SIGTERM);
+  EXPECT_EQ(daemon.waitForExit(), 0) << daemon.rawStderr();
+  return daemon.lines(wellFormed);
 }
 
-const std::string kCheckIn = "debug [main] battery aging update checking in! ";
-const Lines kRun = {
-    "debug [main] battery aging periodic trigger",
-    "debug [main] trigger condition met, start to run some workload...",
-    "debug [main] battery aging compensation has finished successfully",
-};
-
-TEST(Daemon, FirstStartUploadsRunsTheActivityAndStopsCleanly) {
-  DeviceCopy device;
-  test::DaemonProcess daemon(device.dir());
-  ASSERT_TRUE(daemon.running());
-  // The upload's last line, so that it comes before the stop's however slowly
-  // the task runs (under an emulator, say).
-  ASSERT_TRUE(daemon.waitForLine({"upload succeeded"}));
-  ASSERT_TRUE(daemon.waitForLine({"checking in"}));
-  daemon.signal(SIGUSR1);
-  ASSERT_TRUE(daemon.waitForLine({"compensation has finished"}));
-  daemon.signal(SIGTERM);
-  EXPECT_EQ(daemon.waitForExit(), 0);
-
+TEST(Daemon, UploadsOncePerBootSessionServesTheActivityAndStopsCleanly) {
+  Device device;
   bool wellFormed = false;
-  Lines lines = daemon.lines(&wellFormed);
-  EXPECT_TRUE(wellFormed) << daemon.rawStderr();
-  // The task and the activity run on threads of their own: each keeps its order.
-  const Lines task = {
+  // The upload's last line first, so that it comes before the stop's however
+  // slowly the task runs (under an emulator, say).
+  Lines lines = runDaemon(
+      device, "debug", {"upload succeeded"},
+      [](test::DaemonProcess& daemon) {
+        ASSERT_TRUE(daemon.waitForLine({"checking in"}));
+        daemon.signal(SIGUSR1);
+        ASSERT_TRUE(daemon.waitForLine({"compensation has finished"}));
+      },
+      &wellFormed);
+  EXPECT_TRUE(wellFormed) << testing::PrintToString(lines);
+  // The task (the first three) and the activity run on threads of their own:
+  // each keeps its order, and the stop comes last.
+  const Lines expected = {
       "debug [main] Battery data upload run for chemId 0x2168",
       "debug [batteryModelDataHandling] -[BatteryModelDataHandler getBatteryModelFileURLString:] "
       "workingDirURL resource: " +
-          (device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel").string() + " ",
+          (device.models() / "T618e/2168.rcmodel").string() + " ",
       "default [main] Battery data upload succeeded",
-  };
-  Lines activity = {kCheckIn};
-  activity.insert(activity.end(), kRun.begin(), kRun.end());
-  EXPECT_EQ(only(lines, task), task) << daemon.rawStderr();
-  EXPECT_EQ(only(lines, activity), activity) << daemon.rawStderr();
-  EXPECT_EQ(lines.back(), "debug [dispatch] stopping on signal 15");
-  EXPECT_EQ(lines.size(), task.size() + activity.size() + 1) << daemon.rawStderr();
+      "debug [main] battery aging update checking in! ",
+      "debug [main] battery aging periodic trigger",
+      "debug [main] trigger condition met, start to run some workload...",
+      "debug [main] battery aging compensation has finished successfully",
+      "debug [dispatch] stopping on signal 15"};
+  std::stable_partition(lines.begin(), lines.end(), [&](const std::string& l) {
+    return std::find(expected.begin(), expected.begin() + 3, l) != expected.begin() + 3;
+  });
+  EXPECT_EQ(lines, expected);
+  EXPECT_EQ(device.state(), (json{{"savedBootUUID", "11111111-2222-3333-4444-555555555555"},
+                                  {"savedChemID", 8552},
+                                  {"updateConditionMet", false}}));
 
-  EXPECT_EQ(device.state(), (nlohmann::json{{"savedBootUUID", device.bootUUID()},
-                                            {"savedChemID", 8552},
-                                            {"updateConditionMet", false}}));
-}
-
-TEST(Daemon, SecondStartInTheSameBootSessionSkipsAndAReebootUploadsAgain) {
-  DeviceCopy device;
-  for (const char* start : {"first", "second"}) {
-    SCOPED_TRACE(start);
-    test::DaemonProcess daemon(device.dir(), "default");
-    ASSERT_TRUE(daemon.waitForLine({"upload succeeded", "Skipping"}));
-    daemon.signal(SIGTERM);
-    EXPECT_EQ(daemon.waitForExit(), 0);
-    if (std::string(start) == "second") {
-      EXPECT_EQ(daemon.lines(), Lines{"default [main] Main Unchanged boot UUID. Skipping battery "
-                                      "model task"});
-    }
-  }
-  device.json()["sysctl"]["kern.bootsessionuuid"] = "99999999-8888-7777-6666-555555555555";
-  device.save();
-  test::DaemonProcess daemon(device.dir(), "default");
-  ASSERT_TRUE(daemon.waitForLine({"Battery data upload"}));
-  daemon.signal(SIGTERM);
-  EXPECT_EQ(daemon.waitForExit(), 0);
-  EXPECT_EQ(daemon.lines(), Lines{"default [main] Battery data upload succeeded"});
-  EXPECT_EQ(device.state()["savedBootUUID"], "99999999-8888-7777-6666-555555555555");
-}
-
-TEST(Daemon, MalformedDeviceFileIsLoggedAndTheDaemonStaysUp) {
-  DeviceCopy device;
-  std::ofstream(device.dir() / "device.json") << "{ not json";
-  test::DaemonProcess daemon(device.dir(), "default");
-  ASSERT_TRUE(daemon.waitForLine({"Unable to get current boot UUID"}));
-  daemon.signal(SIGUSR1);
-  daemon.signal(SIGINT);
-  EXPECT_EQ(daemon.waitForExit(), 0);
-  Lines lines = daemon.lines();
-  EXPECT_EQ(std::count(lines.begin(), lines.end(), "error [main] Unable to get current boot UUID"),
-            1)
-      << daemon.rawStderr();
+  EXPECT_EQ(runDaemon(device, "default", {"Skipping"}),
+            Lines{"default [main] Main Unchanged boot UUID. Skipping battery model task"});
+  // After a reboot it uploads again. A log-level setting with items it does
+  // not understand is named in one line, and the defaults apply.
+  json rebooted = test::defaultDeviceJSON();
+  rebooted["sysctl"]["kern.bootsessionuuid"] = "99999999-8888-7777-6666-555555555555";
+  device.writeDeviceJSON(rebooted);
+  Lines again =
+      runDaemon(device, "garbage,main=loud,batteryModelDataHandling=debug", {"upload succeeded"});
+  ASSERT_EQ(again.size(), 2u) << testing::PrintToString(again);
+  EXPECT_TRUE(again[0].starts_with(
+      "error [platform] KOLVRAND_LOG_LEVEL: \"garbage\", \"main=loud\" not understood"));
+  EXPECT_EQ(again[1], "default [main] Battery data upload succeeded");
+  EXPECT_EQ(device.state()["savedBootUUID"], rebooted["sysctl"]["kern.bootsessionuuid"]);
 }
 
 // Whoever sets the target type must not lead the daemon out of the Library:
@@ -133,46 +94,37 @@ TEST(Daemon, MalformedDeviceFileIsLoggedAndTheDaemonStaysUp) {
 // whatever lies where it points, and rcmodel status says the same.
 TEST(Daemon, DeviceTypeThatIsNoDirectoryNameNamesNoFile) {
   const std::string kOld = "00000000-0000-0000-0000-000000000000";
-  const std::vector<std::string> types = {
-      "..", ".", "", "a/b", "/ABS", "../../../x", std::string("x\0/../../../x", 14)};
-  for (std::string type : types) {
+  for (std::string type : std::vector<std::string>{"..", ".", "", "a/b", "/ABS", "../../../x",
+                                                   std::string("x\0/../../../x", 14)}) {
     SCOPED_TRACE(type);
-    DeviceCopy device;
-    const fs::path models = device.dir() / "Library/KVR/BatteryModels";
+    Device device;
     if (type == "/ABS") type = (device.dir() / "x").string();
     // A chem ID outside the table, so the target type decides, and its model
     // wherever the type would lead.
-    device.json()["registry"]["TesvarSmartBattery"]["BatteryData"]["AlgoChemID"] = 0x1234;
-    device.json()["sysctl"]["hw.targettype"] = type;
-    device.save();
-    const std::string model = test::readWhole(models / "T618e/2168.rcmodel");
-    for (const fs::path dir :
-         {models, models / "a/b", device.dir() / "x", device.dir() / "Library/KVR"}) {
+    json j = test::defaultDeviceJSON();
+    j["registry"]["TesvarSmartBattery"]["BatteryData"]["AlgoChemID"] = 0x1234;
+    j["sysctl"]["hw.targettype"] = type;
+    device.writeDeviceJSON(j);
+    const std::string model = test::readWhole(device.models() / "T618e/2168.rcmodel");
+    for (const fs::path& dir : {device.models(), device.models() / "a/b", device.dir() / "x",
+                                device.dir() / "Library/KVR"}) {
       fs::create_directories(dir);
       test::writeWhole(dir / "1234.rcmodel", model);
     }
-    fs::create_directories(device.dir() / "state");
-    std::ofstream(device.dir() / "state/com.tesvar.kolvrand.json")
-        << nlohmann::json{{"savedBootUUID", kOld}}.dump();
+    fs::create_directories(device.statePath().parent_path());
+    test::writeWhole(device.statePath(), json{{"savedBootUUID", kOld}}.dump());
 
-    test::DaemonProcess daemon(device.dir(), "error");
-    ASSERT_TRUE(daemon.waitForLine({"upload succeeded", "upload failed"}));
-    daemon.signal(SIGTERM);
-    EXPECT_EQ(daemon.waitForExit(), 0);
-    const std::string path = (models.string() + "/") + type.c_str() + "/1234.rcmodel";
-    EXPECT_EQ(daemon.lines(),
-              (Lines{"error [batteryModelDataHandling] -[BatteryModelDataHandler "
-                     "getBatteryModelFileURLString:] <Error> file not present: " +
-                         path,
-                     "error [batteryModelDataHandling] -[BatteryModelDataHandler "
-                     "moveBatteryModelDataFromDiskToKext:] <Error> file (null) does not exist",
-                     "error [main] Battery data upload failed"}))
-        << daemon.rawStderr();
+    const std::string handler = "error [batteryModelDataHandling] -[BatteryModelDataHandler ";
+    const std::string path = device.models().string() + "/" + type.c_str() + "/1234.rcmodel";
+    EXPECT_EQ(runDaemon(device, "error", {"upload succeeded", "upload failed"}),
+              (Lines{handler + "getBatteryModelFileURLString:] <Error> file not present: " + path,
+                     handler + "moveBatteryModelDataFromDiskToKext:] <Error> file (null) does "
+                               "not exist",
+                     "error [main] Battery data upload failed"}));
     EXPECT_FALSE(fs::exists(device.dir() / "driver/battery_params.bin"));
     EXPECT_EQ(device.state()["savedBootUUID"], kOld);
 
-    test::Scratch scratch;
-    const test::ToolRun status = scratch.rcmodel({"status"}, "", device.dir().string());
+    const test::ToolRun status = test::Scratch().rcmodel({"status"}, "", device.dir().string());
     EXPECT_NE(status.out.find("\nmodel file exists:   no\n"), std::string::npos) << status.out;
     EXPECT_NE(status.out.find("\nverdict:             missing\n"), std::string::npos) << status.out;
   }
@@ -181,44 +133,26 @@ TEST(Daemon, DeviceTypeThatIsNoDirectoryNameNamesNoFile) {
 // The daemon takes no arguments but answers --help and --version as any Linux
 // program does; in no case does an argument start it.
 TEST(Daemon, ArgumentsAreAnsweredWithoutStartingTheDaemon) {
-  struct Case {
+  const struct {
     std::vector<std::string> args;
     int status;
     std::string out, err;  // what each starts with
-  } const cases[] = {
+  } cases[] = {
       {{"--help"}, 0, "usage: kolvrand [--help | --version]\n", ""},
       {{"--version"}, 0, "kolvrand " KOLVRAND_VERSION "\n", ""},
       {{"-h"}, 2, "", "kolvrand: unexpected argument \"-h\"\nusage: kolvrand"},
       {{"--help", "extra"}, 2, "", "kolvrand: unexpected argument \"extra\"\nusage: kolvrand"},
   };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.args.front());
-    DeviceCopy device;
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.args.back());
+    Device device;
     test::DaemonProcess daemon(device.dir(), "debug", {}, c.args);
     EXPECT_EQ(daemon.waitForExit(), c.status);
     EXPECT_TRUE(daemon.rawStdout().starts_with(c.out)) << daemon.rawStdout();
     EXPECT_TRUE(daemon.rawStderr().starts_with(c.err)) << daemon.rawStderr();
-    if (c.err.empty()) EXPECT_EQ(daemon.rawStderr(), "");
-    EXPECT_FALSE(fs::exists(device.dir() / "state"));
-    EXPECT_FALSE(fs::exists(device.dir() / "driver"));
+    EXPECT_EQ(daemon.rawStderr().empty(), c.err.empty());
+    EXPECT_FALSE(fs::exists(device.dir() / "state") || fs::exists(device.dir() / "driver"));
   }
-}
-
-// A log-level setting the daemon does not understand is named in one line,
-// and the defaults apply.
-TEST(Daemon, UnderstoodLogLevelsOnly) {
-  DeviceCopy device;
-  test::DaemonProcess daemon(device.dir(), "garbage,main=loud,batteryModelDataHandling=debug");
-  ASSERT_TRUE(daemon.waitForLine({"upload succeeded"}));
-  daemon.signal(SIGTERM);
-  EXPECT_EQ(daemon.waitForExit(), 0);
-  const Lines lines = daemon.lines();
-  ASSERT_FALSE(lines.empty());
-  EXPECT_TRUE(lines.front().starts_with(
-      "error [platform] KOLVRAND_LOG_LEVEL: \"garbage\", \"main=loud\" not understood"))
-      << daemon.rawStderr();
-  EXPECT_EQ(Lines(lines.begin() + 1, lines.end()),
-            Lines{"default [main] Battery data upload succeeded"});
 }
 
 }  // namespace

@@ -1,11 +1,11 @@
-// The simulated device, and the kernel-variable, registry, driver and hashing
-// operations that read it.
+// The simulated device; the kernel-variable, registry, driver and hashing
+// operations that read it; and the defaults kept in its state directory.
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <cerrno>
 
 #include "platform/CommonCrypto.h"
+#include "platform/Defaults.h"
 #include "platform/IOKit.h"
 #include "platform/Sysctl.h"
 #include "tests/platform/TestUtil.h"
@@ -15,6 +15,7 @@ namespace kolvrand {
 namespace {
 
 namespace fs = std::filesystem;
+using nlohmann::json;
 
 std::optional<std::string> readSysctl(const char* name) {
   size_t len = 0;
@@ -46,40 +47,30 @@ TEST(SimulatedDevice, KernelVariablesAndRegistryAreServedAsGiven) {
   // The two-call protocol: the length first (with its NUL), then the bytes.
   EXPECT_EQ(readSysctl("kern.bootsessionuuid"), std::string("0f1e-boot\0", 10));
   EXPECT_EQ(readSysctl("hw.targettype"), std::string("\xff\x00\xfe", 3));
-  const struct {
-    const char* name;
-    size_t bufferSize;
-    bool queryOnly, withNewValue, withLength;
-    int error;
-  } failures[] = {
-      {"kern.nosuchvariable", 0, true, false, true, ENOENT},
-      {"kern.bootsessionuuid", 9, false, false, true, ENOMEM},
-      {"kern.bootsessionuuid", 16, false, true, true, EPERM},
-      {"kern.bootsessionuuid", 16, false, false, false, EINVAL},
-  };
-  for (const auto& c : failures) {
-    char out[16];
-    size_t n = c.bufferSize;
-    errno = 0;
-    EXPECT_EQ(sysctlbyname(c.name, c.queryOnly ? nullptr : out, c.withLength ? &n : nullptr,
-                           c.withNewValue ? "x" : nullptr, c.withNewValue ? 1 : 0),
-              -1);
-    EXPECT_EQ(errno, c.error) << c.name << " " << c.bufferSize;
-  }
+  const auto error = [](int result) { return result == -1 ? errno : 0; };
+  char out[16];
+  size_t n = 9;  // one short
+  EXPECT_EQ(error(sysctlbyname("kern.bootsessionuuid", out, &n, nullptr, 0)), ENOMEM);
+  EXPECT_EQ(error(sysctlbyname("kern.nosuchvariable", nullptr, &n, nullptr, 0)), ENOENT);
+  EXPECT_EQ(error(sysctlbyname(nullptr, nullptr, &n, nullptr, 0)), ENOENT);
+  EXPECT_EQ(error(sysctlbyname("kern.bootsessionuuid", nullptr, &n, "x", 1)), EPERM);
+  EXPECT_EQ(error(sysctlbyname("kern.bootsessionuuid", out, nullptr, nullptr, 0)), EINVAL);
 
   io_service_t battery = service("TesvarSmartBattery");
   ASSERT_NE(battery, 0u);
+  EXPECT_EQ(service(""), 0u);
   EXPECT_FALSE(IORegistryEntryCreateCFProperty(battery, "NoSuchProperty"));
+  EXPECT_FALSE(IORegistryEntryCreateCFProperty(0, "BatteryData"));
   auto data = IORegistryEntryCreateCFProperty(battery, "BatteryData");
-  const auto n = [](int64_t v) { return Value(Number::fromSigned(v)); };
+  const auto i = [](int64_t v) { return Value(Number::fromSigned(v)); };
   EXPECT_EQ(data, Value(Dictionary{
-                      {"Z", n(1)},
+                      {"Z", i(1)},
                       {"Big", Value(Number::fromUnsigned(UINT64_MAX))},
                       {"F", Value(Number::fromDouble(0.5))},
                       {"On", Value(true)},
-                      {"List", Value(Array{n(1), Value("two")})},
+                      {"List", Value(Array{i(1), Value("two")})},
                       {"Raw", Value(Data{0x0a, 0xff})},
-                      {"NotData", Value(Dictionary{{"$data", Value("00")}, {"x", n(1)}})},
+                      {"NotData", Value(Dictionary{{"$data", Value("00")}, {"x", i(1)}})},
                   }));
   EXPECT_EQ(data->asDictionary()->begin()->first, "Z");  // the file's order is kept
 }
@@ -93,29 +84,27 @@ TEST(SimulatedDevice, BadDeviceFilesGiveAnEmptyDevice) {
   };
   const std::string bad[] = {
       "",
-      "{",
       "[]",
       R"({"sysctl": []})",
       R"({"sysctl": {"kern.bootsessionuuid": 5}})",
       R"({"sysctl": {"kern.bootsessionuuid": {"$data": "abc"}}})",
       R"({"sysctl": {"kern.bootsessionuuid": {"$data": "zz"}}})",
-      "{\"sysctl\": {\"kern.bootsessionuuid\": \"\xff\xfe\"}}",
-      R"({"sysctl": {"kern.bootsessionuuid": "1111)",
+      R"({"sysctl": {"kern.bootsessionuuid": {"$data": 12}}})",
       R"({"sysctl": {"kern.bootsessionuuid": ")" + std::string(4 << 20, 'x') + "\", 1}}",
+      R"({"registry": []})",
       R"({"registry": {"TesvarSmartBattery": 1}})",
       R"({"registry": {"TesvarSmartBattery": {"BatteryData": {"AlgoChemID": null}}}})",
       R"({"sysctl": {"kern.bootsessionuuid": "b"}, "registry": {"TesvarKVR": 3}})",
-      R"({"driver": {"openResult": "0"}})",
+      R"({"driver": []})",
       R"({"driver": {"openResult": 1.5}})",
+      R"({"driver": {"openResult": -2147483649}})",
       R"({"driver": {"setBatteryParamsResult": 1099511627776}})",
       nested(65),
       nested(200000),
   };
   const auto check = [](const test::TestDevice& device, const std::string& label) {
     const auto lines = device.logLines();
-    EXPECT_EQ(std::count_if(lines.begin(), lines.end(),
-                            [](const std::string& l) { return l.starts_with("error [device]"); }),
-              1)
+    EXPECT_TRUE(lines.size() == 1 && lines[0].starts_with("error [device] simulated device "))
         << label << testing::PrintToString(lines);
     EXPECT_EQ(service("TesvarKVR"), 0u) << label;
     EXPECT_FALSE(readSysctl("kern.bootsessionuuid")) << label;
@@ -132,105 +121,131 @@ TEST(SimulatedDevice, BadDeviceFilesGiveAnEmptyDevice) {
   EXPECT_TRUE(readSysctl("kern.bootsessionuuid"));
 }
 
-constexpr size_t kRecordSize = 29056;
-
-std::vector<uint8_t> record(uint8_t seed) {
-  std::vector<uint8_t> r(kRecordSize);
-  for (size_t i = 0; i < r.size(); ++i) r[i] = static_cast<uint8_t>(i * 31 + seed);
-  return r;
-}
-
-io_connect_t open() {
-  io_connect_t c = 0;
-  EXPECT_EQ(IOServiceOpen(service("TesvarKVR"), mach_task_self(), 0, &c), kIOReturnSuccess);
-  return c;
-}
-kern_return_t send(io_connect_t c, const std::vector<uint8_t>& r, uint32_t selector = 24) {
-  return IOConnectCallStructMethod(c, selector, r.data(), r.size(), nullptr, nullptr);
-}
-std::optional<Value> published() {
-  return IORegistryEntryCreateCFProperty(service("TesvarKVR"), "KVRVector");
-}
-Value hashProperty(const std::vector<uint8_t>& r) {
-  const SHA1Digest d = sha1(r.data(), r.size());
-  return Value(
-      Dictionary{{"KVRBatteryModel", Dictionary{{"RCParamsHash", Data(d.begin(), d.end())}}}});
-}
-
+// Which driver calls are refused, what an accepted record leaves, and the
+// configured and real failures. (The results the daemon meets, and a
+// KVRVector given in device.json, are crossed by the transfer tests.)
 TEST(SimulatedDriver, KeepsOnlyTheRecordAndPublishesItsHash) {
   test::TestDevice device;
   const fs::path kept = device.dir() / "driver" / "battery_params.bin";
-  io_connect_t c = open();
-  ASSERT_NE(c, 0u);
-  const std::pair<uint32_t, size_t> refused[] = {
-      {24, kRecordSize - 1}, {24, kRecordSize + 1}, {24, 0}, {23, kRecordSize}};
-  for (const auto& [selector, size] : refused)
-    EXPECT_EQ(send(c, std::vector<uint8_t>(size, 1), selector), kIOReturnBadArgument) << size;
-  auto r = record(7);
+  const io_service_t kvr = service("TesvarKVR"), battery = service("TesvarSmartBattery");
+  io_connect_t c = 0;
+  EXPECT_EQ(IOServiceOpen(battery, mach_task_self(), 0, &c), kIOReturnUnsupported);
+  EXPECT_EQ(IOServiceOpen(kvr, mach_task_self(), 1, &c), kIOReturnBadArgument);
+  EXPECT_EQ(IOServiceOpen(0, mach_task_self(), 0, &c), kIOReturnBadArgument);
+  EXPECT_EQ(IOServiceOpen(kvr, mach_task_self(), 0, nullptr), kIOReturnBadArgument);
+  ASSERT_EQ(IOServiceOpen(kvr, mach_task_self(), 0, &c), kIOReturnSuccess);
+  std::vector<uint8_t> r(29056);
+  for (size_t i = 0; i < r.size(); ++i) r[i] = static_cast<uint8_t>(i * 31 + 7);
+  const auto send = [&](io_connect_t c, size_t size, uint32_t selector = 24) {
+    return IOConnectCallStructMethod(c, selector, r.data(), size, nullptr, nullptr);
+  };
+  // Only selector 24, with a record of exactly its size and no output.
+  for (const auto& [selector, size] :
+       {std::pair<uint32_t, size_t>{24, r.size() - 1}, {24, r.size() + 1}, {24, 0}, {23, r.size()}})
+    EXPECT_EQ(send(c, size, selector), kIOReturnBadArgument) << size;
   size_t outSize = 4;
-  uint8_t out[4];
-  EXPECT_EQ(IOConnectCallStructMethod(c, 24, r.data(), r.size(), out, &outSize),
+  EXPECT_EQ(IOConnectCallStructMethod(c, 24, r.data(), r.size(), nullptr, &outSize),
             kIOReturnUnsupported);
-  EXPECT_FALSE(fs::exists(kept));
-  EXPECT_FALSE(published());
+  EXPECT_EQ(IOConnectCallStructMethod(c, 24, nullptr, 1, nullptr, nullptr), kIOReturnBadArgument);
+  EXPECT_EQ(send(0, r.size()), kIOReturnNotOpen);
+  EXPECT_FALSE(fs::exists(kept) || IORegistryEntryCreateCFProperty(kvr, "KVRVector"));
 
-  ASSERT_EQ(send(c, r), kIOReturnSuccess);
+  ASSERT_EQ(send(c, r.size()), kIOReturnSuccess);
   EXPECT_EQ(test::readFileText(kept), std::string(r.begin(), r.end()));
-  EXPECT_EQ(published(), hashProperty(r));
+  const SHA1Digest d = sha1(r.data(), r.size());
+  const Value hash(
+      Dictionary{{"KVRBatteryModel", Dictionary{{"RCParamsHash", Data(d.begin(), d.end())}}}});
+  EXPECT_EQ(IORegistryEntryCreateCFProperty(kvr, "KVRVector"), hash);
   // Closed (and never opened) connections are refused; closing twice is harmless.
-  IOServiceClose(c);
-  IOServiceClose(c);
-  IOServiceClose(12345);
-  EXPECT_EQ(send(c, r), kIOReturnNotOpen);
+  EXPECT_EQ(IOServiceClose(c), kIOReturnSuccess);
+  EXPECT_EQ(IOServiceClose(c), kIOReturnSuccess);
+  EXPECT_EQ(IOServiceClose(0), kIOReturnNotOpen);
+  EXPECT_EQ(send(c, r.size()), kIOReturnNotOpen);
   // The kept record outlives the daemon: a new start still publishes its hash.
   device.reload();
-  EXPECT_EQ(published(), hashProperty(r));
-  ASSERT_EQ(send(open(), record(9)), kIOReturnSuccess);
-  EXPECT_EQ(published(), hashProperty(record(9)));
-
-  // A KVRVector in device.json is published as given, whatever is sent;
-  // null publishes none.
-  const auto load = [&](nlohmann::json kvr, nlohmann::json driver = nlohmann::json::object()) {
-    device.writeDeviceJSON({{"registry", {{"TesvarKVR", kvr}}}, {"driver", driver}});
-    device.reload();
-  };
-  load({{"KVRVector", {{"KVRBatteryModel", {{"RCParamsHash", {{"$data", "0102"}}}}}}}});
-  const Value given(Dictionary{{"KVRBatteryModel", Dictionary{{"RCParamsHash", Data{1, 2}}}}});
-  ASSERT_EQ(send(open(), record(3)), kIOReturnSuccess);
-  EXPECT_EQ(published(), given);
-  load({{"KVRVector", nullptr}});
-  EXPECT_FALSE(published());
-
-  // The configured failures: no connection, or the record refused and not kept.
-  fs::remove(kept);
-  load(nlohmann::json::object(), {{"openResult", 3758097084u}});
-  c = 77;
-  EXPECT_EQ(IOServiceOpen(service("TesvarKVR"), mach_task_self(), 0, &c), kIOReturnError);
+  EXPECT_EQ(IORegistryEntryCreateCFProperty(kvr, "KVRVector"), hash);
+  // A record that cannot be kept is refused.
+  fs::remove_all(kept.parent_path());
+  test::writeFile(kept.parent_path(), "");
+  ASSERT_EQ(IOServiceOpen(kvr, mach_task_self(), 0, &c), kIOReturnSuccess);
+  EXPECT_EQ(send(c, r.size()), kIOReturnError);
+  // A refused connection, its code given in the unsigned form.
+  device.writeDeviceJSON(
+      {{"registry", {{"TesvarKVR", json::object()}}}, {"driver", {{"openResult", 3758097084u}}}});
+  device.reload();
+  EXPECT_EQ(IOServiceOpen(kvr, mach_task_self(), 0, &c), kIOReturnError);
   EXPECT_EQ(c, 0u);
-  load(nlohmann::json::object(), {{"setBatteryParamsResult", -536870212}});
-  EXPECT_EQ(send(open(), record(1)), kIOReturnError);
-  EXPECT_FALSE(fs::exists(kept));
-  EXPECT_FALSE(published());
 }
 
 TEST(HostBackend, BootSessionIsTheKernelBootIdAndThereIsNoDriver) {
   platform::setBackend(platform::makeHostBackend());
   std::string bootId = test::readFileText("/proc/sys/kernel/random/boot_id");
-  if (!bootId.empty()) {
-    EXPECT_EQ(readSysctl("kern.bootsessionuuid"), bootId.substr(0, bootId.size() - 1) + '\0');
-  }
+  EXPECT_EQ(
+      readSysctl("kern.bootsessionuuid"),
+      bootId.empty() ? std::nullopt : std::optional(bootId.substr(0, bootId.size() - 1) + '\0'));
+  // The board's name, where the host has one, ends in a single NUL.
+  const auto type = readSysctl("hw.targettype");
+  EXPECT_TRUE(!type || (type->size() > 1 && type->find('\0') == type->size() - 1));
   EXPECT_FALSE(readSysctl("kern.nosuchvariable"));
   EXPECT_EQ(service("TesvarKVR"), 0u);
   platform::setBackend(nullptr);
 }
 
-TEST(SHA1, MatchesTheStandardVectors) {
-  for (const auto& [input, digest] :
-       {std::pair<std::string, const char*>{"abc", "a9993e364706816aba3e25717850c26c9cd0d89d"},
-        {std::string(1000000, 'a'), "34aa973cd4c4daa4f61eeb2bdbad27316534016f"}}) {
-    const SHA1Digest d = sha1(input.data(), input.size());
-    EXPECT_EQ(hexString(d.data(), d.size()), digest);
-  }
+constexpr const char* kSuite = "com.tesvar.kolvrand";
+
+TEST(Defaults, ReadEachTypeOnlyAsItselfSeeWritesMadeElsewhereAndFailWithoutADirectory) {
+  test::TestDevice device;
+  const fs::path dir = device.dir() / "state";
+  auto d = NSUserDefaults::initWithSuiteName(kSuite);  // the device's state directory
+  auto same = NSUserDefaults::initWithSuiteName(kSuite, dir / "." / "");
+  ASSERT_TRUE(d && same && d->setObject("C5B4-11", "s") && d->setInteger(INT64_MIN, "min") &&
+              d->setBool(true, "b"));
+  test::writeFile(dir / "other.json", R"({"big": 18446744073709551615, "f": 1.5, "n": null})");
+  auto other = NSUserDefaults::initWithSuiteName("other", dir);
+  std::string read;  // each key as a string and as a bool
+  for (const auto& [defaults, key] : {std::pair{same, "s"},
+                                      {same, "min"},
+                                      {same, "b"},
+                                      {d, "absent"},
+                                      {other, "big"},
+                                      {other, "f"},
+                                      {other, "n"}})
+    read += std::string(key) + "=" + defaults->stringForKey(key).value_or("nil") + "/" +
+            (defaults->boolForKey(key) ? "true " : "false ");
+  EXPECT_EQ(read,
+            "s=C5B4-11/false min=nil/false b=nil/true absent=nil/false big=nil/false f=nil/false "
+            "n=nil/false ");
+  EXPECT_EQ(json::parse(test::readFileText(d->path())),
+            json({{"s", "C5B4-11"}, {"min", INT64_MIN}, {"b", true}}));
+  // Another process replacing the file is seen at the next read.
+  test::writeFile(d->path(), R"({"s": "two"})");
+  EXPECT_EQ(same->stringForKey("s"), "two");
+
+  // No directory where a file is, and names that are no file names.
+  EXPECT_FALSE(NSUserDefaults::initWithSuiteName(kSuite, device.dir() / "device.json" / "state"));
+  for (const char* name : {"", ".", "..", "a/b"})
+    EXPECT_FALSE(NSUserDefaults::initWithSuiteName(name, dir) ||
+                 NSUserDefaults::openExistingSuiteNamed(name, dir))
+        << name;
+  // A missing directory, nested too, is created.
+  auto nested = NSUserDefaults::initWithSuiteName(kSuite, dir / "a" / "b");
+  EXPECT_TRUE(nested && nested->setInteger(1, "k"));
+  // A lock that cannot be taken, or a suite file that is a directory: nothing
+  // is written, and the latter reads as empty.
+  fs::create_directories(dir / "locked.json.lock");
+  EXPECT_FALSE(NSUserDefaults::initWithSuiteName("locked", dir)->setBool(true, "k"));
+  fs::create_directories(dir / "folder.json");
+  auto folder = NSUserDefaults::initWithSuiteName("folder", dir);
+  EXPECT_FALSE(folder->setBool(true, "k") || folder->boolForKey("k"));
+
+  // Opened for reading only, as tools do (crossed further by rcmodel status):
+  // nothing is written, not even a lock file.
+  fs::remove(d->path().string() + ".lock");
+  auto existing = NSUserDefaults::openExistingSuiteNamed(kSuite, dir);
+  ASSERT_TRUE(existing);
+  EXPECT_FALSE(existing->setObject("v", "s"));
+  EXPECT_EQ(existing->stringForKey("s"), "two");
+  EXPECT_FALSE(fs::exists(d->path().string() + ".lock"));
 }
 
 }  // namespace

@@ -1,31 +1,20 @@
+// Serial queues, the main loop's signals and the activity service.
 #include <gtest/gtest.h>
 #include <signal.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
-#include <chrono>
 #include <future>
+#include <mutex>
+#include <set>
 #include <thread>
 
+#include "platform/Activity.h"
 #include "platform/Dispatch.h"
 
 namespace kolvrand {
 namespace {
 
 using namespace std::chrono_literals;
-
-dispatch_queue_t makeQueue() {
-  return dispatch_queue_create(
-      "test", dispatch_queue_attr_make_with_autorelease_frequency(
-                  DISPATCH_QUEUE_SERIAL, DISPATCH_AUTORELEASE_FREQUENCY_WORK_ITEM));
-}
-
-// Records into `events` when the last copy of it goes away.
-struct Marker {
-  std::vector<std::string>* events;
-  int id;
-  ~Marker() { events->push_back("free " + std::to_string(id)); }
-};
+using Strings = std::vector<std::string>;
 
 bool servedSignalsBlocked() {
   sigset_t set;
@@ -35,110 +24,109 @@ bool servedSignalsBlocked() {
 
 // Creating a queue also leaves the served signals to the main loop, in the
 // caller and in the worker.
-TEST(DispatchQueue, RunsBlocksInOrderOnOneWorkerAndFreesEachRightAfterItRan) {
-  auto q = makeQueue();
+TEST(DispatchQueue, RunsInOrderOnOneWorkerFreesEachBlockAndStopsAfterTheOneInProgress) {
+  auto q = dispatch_queue_create(
+      "test", dispatch_queue_attr_make_with_autorelease_frequency(
+                  DISPATCH_QUEUE_SERIAL, DISPATCH_AUTORELEASE_FREQUENCY_WORK_ITEM));
   EXPECT_TRUE(servedSignalsBlocked());
-  std::vector<std::string> events;  // touched only by the worker until drain
-  std::vector<std::thread::id> threads;
-  std::atomic<int> blocked{0};
+  Strings events, expected;  // touched only by the worker until drain or stop
+  std::set<std::thread::id> threads;
+  // Records when the last copy of what a block captured goes away.
+  const auto marker = [&](int id) {
+    return std::shared_ptr<void>(
+        nullptr, [&events, id](void*) { events.push_back("free " + std::to_string(id)); });
+  };
   for (int i = 0; i < 200; ++i) {
-    dispatch_async(q, [&, i, m = std::make_shared<Marker>(&events, i)] {
-      events.push_back("run " + std::to_string(m->id));
-      threads.push_back(std::this_thread::get_id());
-      blocked += servedSignalsBlocked();
+    dispatch_async(q, [&, i, m = marker(i)] {
+      events.push_back("run " + std::to_string(i) + (servedSignalsBlocked() ? "" : " unmasked"));
+      threads.insert(std::this_thread::get_id());
     });
+    expected.insert(expected.end(), {"run " + std::to_string(i), "free " + std::to_string(i)});
   }
   q->drain();
-  ASSERT_EQ(events.size(), 400u);
-  for (int i = 0; i < 200; ++i) {
-    EXPECT_EQ(events[2 * i], "run " + std::to_string(i));
-    EXPECT_EQ(events[2 * i + 1], "free " + std::to_string(i));
-  }
-  EXPECT_NE(threads.front(), std::this_thread::get_id());
-  EXPECT_EQ(std::count(threads.begin(), threads.end(), threads.front()), 200);
-  EXPECT_EQ(blocked, 200);
-}
+  EXPECT_EQ(events, expected);
+  EXPECT_EQ(threads.size(), 1u);
+  EXPECT_FALSE(threads.contains(std::this_thread::get_id()));
 
-TEST(DispatchQueue, StopFinishesTheBlockInProgressAndDropsTheRest) {
-  auto q = makeQueue();
+  // Stopped, it lets the block in progress finish and drops (and frees) the
+  // rest, and whatever comes later.
+  events.clear();
   std::promise<void> started;
-  std::atomic<bool> finished{false}, ranLater{false};
-  std::vector<std::string> events;
   dispatch_async(q, [&] {
     started.set_value();
     std::this_thread::sleep_for(50ms);
-    finished = true;
+    events.push_back("finished");
   });
-  dispatch_async(q, [&] { ranLater = true; });
+  dispatch_async(q, [&, m = marker(1)] { events.push_back("ran 1"); });
   started.get_future().wait();
   q->stop();
-  EXPECT_TRUE(finished);
-  dispatch_async(q, [&, m = std::make_shared<Marker>(&events, 1)] { ranLater = true; });
+  dispatch_async(q, [&, m = marker(2)] { events.push_back("ran 2"); });
   q->drain();
-  EXPECT_FALSE(ranLater);
-  EXPECT_EQ(events, std::vector<std::string>{"free 1"});  // dropped blocks are freed
+  EXPECT_EQ(events, (Strings{"finished", "free 1", "free 2"}));
 
   // A queue may be released by its own block.
-  q = makeQueue();
+  q = dispatch_queue_create("test", DISPATCH_QUEUE_SERIAL);
   std::promise<void> released;
   dispatch_async(q,
                  [q, m = std::shared_ptr<void>(nullptr, [&](void*) { released.set_value(); })] {});
   q.reset();  // the block now holds the last reference
-  EXPECT_EQ(released.get_future().wait_for(5s), std::future_status::ready);
+  released.get_future().wait();
 }
 
-// The child process runs dispatch_main and first prints its pid; a read
-// that hangs is ended by the test's timeout.
-class MainLoopChild {
- public:
-  explicit MainLoopChild(const std::string& scenario)
-      : out_(::popen((DISPATCH_MAIN_CHILD " " + scenario).c_str(), "r")) {
-    pid_ = std::stoi(line());
-  }
-  ~MainLoopChild() {
-    if (!out_) return;
-    signal(SIGKILL);
-    exitStatus();
-  }
-  std::string line() {  // "" at the end
+// The child runs dispatch_main with one activity (DispatchMainChild.cpp); a
+// read that hangs is ended by the test's timeout.
+TEST(DispatchMain, Sigusr1RunsTheActivitiesAndSigintEndsAfterTheBlockInProgress) {
+  FILE* out = ::popen(DISPATCH_MAIN_CHILD, "r");
+  ASSERT_TRUE(out);
+  const auto line = [out] {
     char buf[256];
-    if (!out_ || !std::fgets(buf, sizeof buf, out_)) return "";
-    std::string l = buf;
+    std::string l = std::fgets(buf, sizeof buf, out) ? buf : "";
     return l.substr(0, l.find('\n'));
-  }
-  void signal(int sig) { ::kill(pid_, sig); }
-  int exitStatus() {  // once the output is read to its end
-    for (std::string l; !(l = line()).empty();) rest.push_back(l);
-    const int status = ::pclose(out_);
-    out_ = nullptr;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-  }
-  std::vector<std::string> rest;  // the lines exitStatus() read
-
- private:
-  FILE* out_;
-  pid_t pid_ = -1;
-};
-
-TEST(DispatchMain, Sigusr1RunsTheActivitiesAndSigintEndsWithStatus0) {
-  MainLoopChild child("activity");
-  EXPECT_EQ(child.line(), "state 0");
-  child.signal(SIGUSR1);
-  EXPECT_EQ(child.line(), "state 2");
-  child.signal(SIGUSR1);
-  EXPECT_EQ(child.line(), "state 2");
-  child.signal(SIGINT);
-  EXPECT_EQ(child.exitStatus(), 0);
-  EXPECT_TRUE(child.rest.empty());
+  };
+  const pid_t pid = std::stoi(line());
+  EXPECT_EQ(line(), "state 0");
+  ::kill(pid, SIGUSR1);
+  EXPECT_EQ(line(), "state 2");
+  EXPECT_EQ(line(), "started");
+  ::kill(pid, SIGINT);
+  // The block in progress finishes, the one queued after it never runs.
+  EXPECT_EQ(line(), "finished");
+  EXPECT_EQ(line(), "");
+  EXPECT_EQ(::pclose(out), 0);  // exited with status 0
 }
 
-TEST(DispatchMain, SigtermLetsTheBlockInProgressFinish) {
-  MainLoopChild child("stop");
-  EXPECT_EQ(child.line(), "started");
-  child.signal(SIGTERM);
-  EXPECT_EQ(child.exitStatus(), 0);
-  // The queued block never ran.
-  EXPECT_EQ(child.rest, std::vector<std::string>{"finished"});
+TEST(Activity, ChecksInAtRegistrationRunsOnEveryDeliveryAndStops) {
+  std::mutex mutex;
+  Strings calls;  // handler:identifier:state
+  std::set<std::thread::id> threads;
+  const auto recorder = [&](std::string name) {
+    return [&, name](xpc_activity_t a) {
+      std::lock_guard lock(mutex);
+      calls.push_back(name + ":" + a->identifier + ":" + std::to_string(xpc_activity_get_state(a)));
+      threads.insert(std::this_thread::get_id());
+    };
+  };
+  const auto runAll = [] {
+    xpc_activity_deliver_run();
+    xpc_activity_drain();
+  };
+  xpc_activity_register("a", XPC_ACTIVITY_CHECK_IN, recorder("h1"));
+  xpc_activity_register("b", XPC_ACTIVITY_CHECK_IN, recorder("h2"));
+  runAll();
+  // Registering an identifier again replaces its handler (and checks it in).
+  xpc_activity_register("a", XPC_ACTIVITY_CHECK_IN, recorder("h3"));
+  runAll();
+  // All on the service's one thread, never the caller's.
+  EXPECT_EQ(threads.size(), 1u);
+  EXPECT_FALSE(threads.contains(std::this_thread::get_id()));
+  // Stopped, it delivers nothing until the next registration.
+  xpc_activity_stop();
+  runAll();
+  xpc_activity_register("c", XPC_ACTIVITY_CHECK_IN, recorder("h4"));
+  runAll();
+  xpc_activity_stop();
+  EXPECT_EQ(calls, (Strings{"h1:a:0", "h2:b:0", "h1:a:2", "h2:b:2", "h3:a:0", "h2:b:2", "h3:a:2",
+                            "h4:c:0", "h4:c:2"}));
 }
 
 }  // namespace
