@@ -147,7 +147,12 @@ TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
     ASSERT_EQ(run("plain").status, 0);
     const std::string expected = readWhole(s / "plain");
     EXPECT_EQ(run("-").out, expected);
+    // Written into the descriptor: the file the harness opened gets the
+    // bytes, rather than a new file under its name.
+    fs::remove(s / "seen");
+    fs::create_hard_link(s / ".stdout", s / "seen");
     EXPECT_EQ(run("stdout").out, expected);
+    EXPECT_EQ(readWhole(s / "seen"), expected);
 
     fs::remove(s / "target");
     EXPECT_EQ(run("link").status, 0) << "dangling";

@@ -2,13 +2,16 @@
 // temporary file renamed over it, so a failed write leaves the old content;
 // a symlink is written through, the file it ends at replaced beside itself;
 // anything else (a FIFO, a terminal, /dev/null) is written in place, since
-// renaming over it would take it from its readers.
+// renaming over it would take it from its readers. A path that names one of
+// this process's descriptors (/dev/stdout, /dev/fd/N, or a link to one) is
+// written into that descriptor, at its offset, as if the tool had printed.
 #include <fcntl.h>
 #include <limits.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <charconv>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
@@ -32,11 +35,26 @@ bool writeAll(int fd, std::string_view bytes) {
   return true;
 }
 
+// The descriptor that /dev/fd/N, /proc/self/fd/N or /proc/thread-self/fd/N
+// names, or -1. Opening such a path would open the file anew at offset 0 and,
+// for a regular file, replacing it would take the name from under the shell.
+int namedDescriptor(const fs::path& path) {
+  std::error_code ec;
+  const fs::path dir = fs::absolute(path, ec).parent_path().lexically_normal();
+  if (dir != "/dev/fd" && dir != "/proc/self/fd" && dir != "/proc/thread-self/fd") return -1;
+  const std::string name = path.filename().string();
+  int fd = -1;
+  auto [end, failed] = std::from_chars(name.data(), name.data() + name.size(), fd);
+  return failed == std::errc() && end == name.data() + name.size() ? fd : -1;
+}
+
 // The path a chain of symlinks starting at `path` ends at, which need not
-// exist (a dangling link is written through as a shell's ">" does); 0, or an
-// errno value in *err.
-fs::path finalTarget(fs::path path, int* err) {
+// exist (a dangling link is written through as a shell's ">" does), or the
+// descriptor in *fd that a path on the way names; 0, or an errno value in
+// *err.
+fs::path finalTarget(fs::path path, int* err, int* fd) {
   for (int hops = 0; hops < 40; ++hops) {
+    if ((*fd = namedDescriptor(path)) >= 0) return path;
     struct stat st {};
     if (::lstat(path.c_str(), &st) != 0 || !S_ISLNK(st.st_mode)) return path;
     char link[PATH_MAX];
@@ -99,6 +117,15 @@ bool writeOutput(const std::string& command, const std::string& path, std::strin
     }
     return true;
   }
+  int err = 0, fd = -1;
+  const fs::path target = finalTarget(path, &err, &fd);
+  if (fd >= 0) {
+    if (!writeAll(fd, bytes)) {
+      error(command, path + ": cannot write: " + std::strerror(errno));
+      return false;
+    }
+    return true;
+  }
   struct stat st {};
   const bool exists = ::stat(path.c_str(), &st) == 0;
   if (!exists && errno != ENOENT) {
@@ -116,8 +143,6 @@ bool writeOutput(const std::string& command, const std::string& path, std::strin
     }
     return true;
   }
-  int err = 0;
-  const fs::path target = finalTarget(path, &err);
   if (!err) err = replaceFile(target, bytes);
   if (err) {
     error(command, path + ": cannot write: " + std::strerror(err) + "; it was left as it was");
