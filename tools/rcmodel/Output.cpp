@@ -109,6 +109,12 @@ int writeInPlace(const std::string& path, std::string_view bytes) {
 
 }  // namespace
 
+bool isStandardOutput(const std::string& path) {
+  int err = 0, fd = -1;
+  finalTarget(path, &err, &fd);
+  return path == "-" || fd == STDOUT_FILENO;
+}
+
 bool writeOutput(const std::string& command, const std::string& path, std::string_view bytes) {
   if (path == "-") {
     if (std::fwrite(bytes.data(), 1, bytes.size(), stdout) != bytes.size() || std::fflush(stdout)) {

@@ -52,7 +52,7 @@ int run(const Arguments& a) {
                                std::string_view(reinterpret_cast<const char*>(record.get()),
                                                 sizeof(KextBatteryModel))))
     return kExitFailed;
-  std::FILE* out = a.output == "-" ? stderr : stdout;
+  std::FILE* out = a.output && isStandardOutput(*a.output) ? stderr : stdout;
   std::fprintf(out, "%s\n", hexString(digest.data(), digest.size()).c_str());
   return kExitOK;
 }

@@ -71,8 +71,12 @@ std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
                                                    const std::string& path);
 // Writes `bytes` to standard output for "-", else to PATH: a regular file (or
 // the one a symlink ends at) is replaced whole or not at all; a FIFO or a
-// device is written in place. false after a one-line message.
+// device is written in place, and a path that names one of the process's
+// descriptors is written into it. false after a one-line message.
 bool writeOutput(const std::string& command, const std::string& path, std::string_view bytes);
+// Whether an output path is standard output: "-", /dev/stdout, /dev/fd/1 or a
+// link to one (what else the command prints then goes to stderr).
+bool isStandardOutput(const std::string& path);
 
 // Routes the platform log to stderr as "rcmodel COMMAND: MESSAGE" lines, with
 // only errors enabled: the daemon's own refusals show, its chatter does not.
@@ -82,6 +86,5 @@ void routeLogToStderr(const std::string& command);
 // reporting the reader's error. *count receives the number of messages.
 std::shared_ptr<OTAParamRC> readFirstModel(const std::string& command, const std::string& path,
                                            size_t* count = nullptr);
-
 
 }  // namespace kolvrand::rcmodel
