@@ -105,14 +105,14 @@ TEST(Daemon, DeviceTypeThatIsNoDirectoryNameNamesNoFile) {
     j["registry"]["TesvarSmartBattery"]["BatteryData"]["AlgoChemID"] = 0x1234;
     j["sysctl"]["hw.targettype"] = type;
     device.writeDeviceJSON(j);
-    const std::string model = test::readWhole(device.models() / "T618e/2168.rcmodel");
+    const std::string model = test::readFile(device.models() / "T618e/2168.rcmodel");
     for (const fs::path& dir : {device.models(), device.models() / "a/b", device.dir() / "x",
                                 device.dir() / "Library/KVR"}) {
       fs::create_directories(dir);
-      test::writeWhole(dir / "1234.rcmodel", model);
+      test::writeFile(dir / "1234.rcmodel", model);
     }
     fs::create_directories(device.statePath().parent_path());
-    test::writeWhole(device.statePath(), json{{"savedBootUUID", kOld}}.dump());
+    test::writeFile(device.statePath(), json{{"savedBootUUID", kOld}}.dump());
 
     const std::string handler = "error [batteryModelDataHandling] -[BatteryModelDataHandler ";
     const std::string path = device.models().string() + "/" + type.c_str() + "/1234.rcmodel";

@@ -21,11 +21,6 @@ namespace fs = std::filesystem;
 using Lines = std::vector<std::string>;
 using nlohmann::json;
 
-std::string contents(const fs::path& path) {
-  std::ifstream in(path, std::ios::binary);
-  return std::string(std::istreambuf_iterator<char>(in), {});
-}
-
 // The chains are the log an operator reads, so they live verbatim in
 // transfer_chains.json: per case the lines, the device.json patch, what the
 // driver publishes as "KVRVector" when the case says (null: the driver's
@@ -50,7 +45,7 @@ TEST(Transfer, EachOutcomeLeavesItsChainTheDriverAndTheMark) {
   const auto built = BatteryModelDataHandler().createKextModelFromProtobufModel(model.get());
   const std::string record(reinterpret_cast<const char*>(built.get()), sizeof *built);
   const json cases =
-      json::parse(contents(KOLVRAND_SOURCE_DIR "/tests/pipeline/transfer_chains.json"));
+      json::parse(test::readFile(KOLVRAND_SOURCE_DIR "/tests/pipeline/transfer_chains.json"));
   ASSERT_EQ(cases.size(), 20u);
   for (const json& c : cases) {
     SCOPED_TRACE(c["case"].get<std::string>());
@@ -76,7 +71,8 @@ TEST(Transfer, EachOutcomeLeavesItsChainTheDriverAndTheMark) {
     // The driver holds the record it accepted, even when the verification
     // failed afterwards, and nothing else.
     const bool accepted = succeeded || c.contains("KVRVector");
-    EXPECT_TRUE(contents(device.dir() / "driver/battery_params.bin") == (accepted ? record : ""))
+    EXPECT_TRUE(test::readFile(device.dir() / "driver/battery_params.bin") ==
+                (accepted ? record : ""))
         << "the driver holds another record";
   }
 }

@@ -3,12 +3,13 @@
 #include <gtest/gtest.h>
 
 #include <cerrno>
+#include <sstream>
 
 #include "platform/CommonCrypto.h"
 #include "platform/Defaults.h"
 #include "platform/IOKit.h"
 #include "platform/Sysctl.h"
-#include "tests/platform/TestUtil.h"
+#include "tests/support/Files.h"
 #include "tests/support/TestDevice.h"
 
 namespace kolvrand {
@@ -82,26 +83,15 @@ TEST(SimulatedDevice, BadDeviceFilesGiveAnEmptyDevice) {
     return R"({"sysctl": {"kern.bootsessionuuid": "1"}, "registry": {"TesvarKVR": {"P": )" +
            std::string(depth, '[') + std::string(depth, ']') + "}}}";
   };
-  const std::string bad[] = {
-      "",
-      "[]",
-      R"({"sysctl": []})",
-      R"({"sysctl": {"kern.bootsessionuuid": 5}})",
-      R"({"sysctl": {"kern.bootsessionuuid": {"$data": "abc"}}})",
-      R"({"sysctl": {"kern.bootsessionuuid": {"$data": "zz"}}})",
-      R"({"sysctl": {"kern.bootsessionuuid": {"$data": 12}}})",
-      R"({"sysctl": {"kern.bootsessionuuid": ")" + std::string(4 << 20, 'x') + "\", 1}}",
-      R"({"registry": []})",
-      R"({"registry": {"TesvarSmartBattery": 1}})",
-      R"({"registry": {"TesvarSmartBattery": {"BatteryData": {"AlgoChemID": null}}}})",
-      R"({"sysctl": {"kern.bootsessionuuid": "b"}, "registry": {"TesvarKVR": 3}})",
-      R"({"driver": []})",
-      R"({"driver": {"openResult": 1.5}})",
-      R"({"driver": {"openResult": -2147483649}})",
-      R"({"driver": {"setBatteryParamsResult": 1099511627776}})",
-      nested(65),
-      nested(200000),
-  };
+  // Each line of bad_devices.txt is one device.json; then an empty one,
+  // nestings past the bound, and 4 MiB that break off.
+  std::vector<std::string> bad;
+  std::istringstream lines(test::readFile(KOLVRAND_SOURCE_DIR "/tests/platform/bad_devices.txt"));
+  for (std::string line; std::getline(lines, line);) bad.push_back(line);
+  bad.insert(bad.end(),
+             {"", nested(65), nested(200000),
+              R"({"sysctl": {"kern.bootsessionuuid": ")" + std::string(4 << 20, 'x') + "\", 1}}"});
+
   const auto check = [](const test::TestDevice& device, const std::string& label) {
     const auto lines = device.logLines();
     EXPECT_TRUE(lines.size() == 1 && lines[0].starts_with("error [device] simulated device "))
@@ -151,7 +141,7 @@ TEST(SimulatedDriver, KeepsOnlyTheRecordAndPublishesItsHash) {
   EXPECT_FALSE(fs::exists(kept) || IORegistryEntryCreateCFProperty(kvr, "KVRVector"));
 
   ASSERT_EQ(send(c, r.size()), kIOReturnSuccess);
-  EXPECT_EQ(test::readFileText(kept), std::string(r.begin(), r.end()));
+  EXPECT_EQ(test::readFile(kept), std::string(r.begin(), r.end()));
   const SHA1Digest d = sha1(r.data(), r.size());
   const Value hash(
       Dictionary{{"KVRBatteryModel", Dictionary{{"RCParamsHash", Data(d.begin(), d.end())}}}});
@@ -179,7 +169,7 @@ TEST(SimulatedDriver, KeepsOnlyTheRecordAndPublishesItsHash) {
 
 TEST(HostBackend, BootSessionIsTheKernelBootIdAndThereIsNoDriver) {
   platform::setBackend(platform::makeHostBackend());
-  std::string bootId = test::readFileText("/proc/sys/kernel/random/boot_id");
+  std::string bootId = test::readFile("/proc/sys/kernel/random/boot_id");
   EXPECT_EQ(
       readSysctl("kern.bootsessionuuid"),
       bootId.empty() ? std::nullopt : std::optional(bootId.substr(0, bootId.size() - 1) + '\0'));
@@ -215,7 +205,7 @@ TEST(Defaults, ReadEachTypeOnlyAsItselfSeeWritesMadeElsewhereAndFailWithoutADire
   EXPECT_EQ(read,
             "s=C5B4-11/false min=nil/false b=nil/true absent=nil/false big=nil/false f=nil/false "
             "n=nil/false ");
-  EXPECT_EQ(json::parse(test::readFileText(d->path())),
+  EXPECT_EQ(json::parse(test::readFile(d->path())),
             json({{"s", "C5B4-11"}, {"min", INT64_MIN}, {"b", true}}));
   // Another process replacing the file is seen at the next read.
   test::writeFile(d->path(), R"({"s": "two"})");

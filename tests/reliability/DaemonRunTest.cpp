@@ -16,6 +16,7 @@
 
 #include "pipeline/PBStreamReader.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Files.h"
 
 namespace kolvrand::test {
 namespace {
@@ -30,25 +31,13 @@ const json kEarlierState = {
     {"savedBootUUID", "earlier-boot"}, {"savedChemID", 8552}, {"updateConditionMet", false}};
 const std::string kBootUUID = "6f1c2b7e-3d4a-4e5f-9a1b-2c3d4e5f6a7b";  // of the example device
 
-std::string readWhole(const fs::path& path) {
-  std::ifstream in(path, std::ios::binary);
-  return std::string(std::istreambuf_iterator<char>(in), {});
-}
-void writeWhole(const fs::path& path, std::string_view bytes) {
-  std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
-}
-
-const std::string kExample = readWhole(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device" / kModel);
+const std::string kExample = readFile(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device" / kModel);
 
 struct ExampleDevice {
   ExampleDevice() {
     fs::copy(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device", dir, fs::copy_options::recursive);
     fs::create_directory(path("state"));
-    writeWhole(path(kState), kEarlierState.dump(2));
-  }
-  ~ExampleDevice() {
-    std::error_code ec;
-    fs::remove_all(dir, ec);
+    writeFile(path(kState), kEarlierState.dump(2));
   }
   fs::path path(const fs::path& relative) const { return dir / relative; }
   // Whole, and holding the earlier values, or the new boot session after an
@@ -56,12 +45,12 @@ struct ExampleDevice {
   void expectSettings(bool uploaded) const {
     json expected = kEarlierState;
     if (uploaded) expected["savedBootUUID"] = kBootUUID;
-    EXPECT_EQ(json::parse(readWhole(path(kState)), nullptr, false), expected)
-        << readWhole(path(kState));
+    EXPECT_EQ(json::parse(readFile(path(kState)), nullptr, false), expected)
+        << readFile(path(kState));
   }
 
-  std::string pattern = "/tmp/kolvrand-device.XXXXXX";
-  const fs::path dir = mkdtemp(pattern.data());
+  const TempDir temp;
+  const fs::path dir = temp.path();
   std::vector<std::string> launcher;  // runs the daemon in its place, such as setpriv
 };
 
@@ -113,8 +102,8 @@ Lines runDaemon(const ExampleDevice& device, Outcome outcome, bool during = fals
 // (./scripts/test --tsan) would break the lines or the exit status.
 TEST(Concurrency, DaemonRunsActivitiesDuringTheUpload) {
   ExampleDevice device;
-  writeWhole(device.path(kModel),
-             kExample + std::string(PBStreamReader::kMaxFileSize - kExample.size(), '\0'));
+  writeFile(device.path(kModel),
+            kExample + std::string(PBStreamReader::kMaxFileSize - kExample.size(), '\0'));
   runDaemon(device, Outcome::Uploaded, true);
 }
 
@@ -154,7 +143,7 @@ std::string nestedGroups(size_t depth) {
 
 using Arrange = std::function<void(ExampleDevice&)>;
 Arrange model(std::string bytes) {
-  return [bytes](ExampleDevice& d) { writeWhole(d.path(kModel), bytes); };
+  return [bytes](ExampleDevice& d) { writeFile(d.path(kModel), bytes); };
 }
 // Something else than a file at the model's path.
 Arrange notAFile(std::function<void(const fs::path&)> make) {
@@ -164,7 +153,7 @@ Arrange notAFile(std::function<void(const fs::path&)> make) {
   };
 }
 Arrange settings(std::string text) {
-  return [text](ExampleDevice& d) { writeWhole(d.path(kState), text); };
+  return [text](ExampleDevice& d) { writeFile(d.path(kState), text); };
 }
 const std::string kLoad =
     "error [batteryModelDataHandling] -[BatteryModelDataHandler loadProtobufModelWithFileName:] "
@@ -221,13 +210,13 @@ const Case kCases[] = {
     // Device data of the wrong shape (each malformed kind is in the platform
     // tests): the daemon meets a device with no boot session and no services.
     {"device.json truncated",
-     [](ExampleDevice& d) { writeWhole(d.path("device.json"), R"({"sysctl": {"kern.boot)"); },
+     [](ExampleDevice& d) { writeFile(d.path("device.json"), R"({"sysctl": {"kern.boot)"); },
      Outcome::NoBootSession, "error [device] simulated device "},
     {"a boot UUID that is not UTF-8",
      [](ExampleDevice& d) {
-       json j = json::parse(readWhole(d.path("device.json")));
+       json j = json::parse(readFile(d.path("device.json")));
        j["sysctl"]["kern.bootsessionuuid"] = {{"$data", "11c3281100"}};
-       writeWhole(d.path("device.json"), j.dump());
+       writeFile(d.path("device.json"), j.dump());
      },
      Outcome::NoBootSession, "error [main] Unable to get current boot UUID"},
     // Settings cut short or holding no object read as empty: the boot session

@@ -12,6 +12,7 @@
 #include <thread>
 
 #include "platform/Defaults.h"
+#include "tests/support/Files.h"
 
 namespace kolvrand {
 namespace {
@@ -23,11 +24,7 @@ const std::string kSuite = "com.tesvar.kolvrand";
 
 // Each writer in a scratch directory of its own, on disk rather than in memory
 // so that a write takes the time a real one does.
-struct Scratch {
-  ~Scratch() { fs::remove_all(dir); }
-  std::string pattern = "/var/tmp/kolvrand-writers.XXXXXX";
-  const fs::path dir = mkdtemp(pattern.data());
-};
+const char* const kDisk = "/var/tmp";
 
 // Waits for the child `pid`; true when it exited with status 0.
 bool exitedCleanly(pid_t pid) {
@@ -59,13 +56,13 @@ microseconds runWriter(const fs::path& dir, int64_t from, microseconds delay) {
 // and the key no writer touches; the next writer is not blocked and removes
 // the temporary file a writer killed before its rename leaves.
 TEST(CrashSafety, SettingsStayWholeWhenAWriterIsKilled) {
-  Scratch scratch;
-  auto defaults = NSUserDefaults::initWithSuiteName(kSuite, scratch.dir);
+  const test::TempDir scratch(kDisk);
+  auto defaults = NSUserDefaults::initWithSuiteName(kSuite, scratch.path());
   ASSERT_TRUE(defaults && defaults->setObject("kept", "other"));
   // How long a whole writer takes (the longest of three), so that the kills
   // spread over its whole run.
   microseconds span{0};
-  for (int i = 0; i < 3; ++i) span = std::max(span, runWriter(scratch.dir, 0, microseconds(-1)));
+  for (int i = 0; i < 3; ++i) span = std::max(span, runWriter(scratch.path(), 0, microseconds(-1)));
   const unsigned seed = std::random_device{}();
   std::mt19937 rng(seed);
   std::uniform_int_distribution<long> delay(0, span.count() * 5 / 4);
@@ -75,8 +72,8 @@ TEST(CrashSafety, SettingsStayWholeWhenAWriterIsKilled) {
     // The next writer is not blocked, and leaves the settings and their lock,
     // no temporary file.
     ASSERT_TRUE(defaults->setObject(std::to_string(trial * 100), "value"));
-    EXPECT_EQ(std::distance(fs::directory_iterator(scratch.dir), {}), 2);
-    runWriter(scratch.dir, trial * 100, microseconds(delay(rng)));
+    EXPECT_EQ(std::distance(fs::directory_iterator(scratch.path()), {}), 2);
+    runWriter(scratch.path(), trial * 100, microseconds(delay(rng)));
     const int64_t value = std::stoll(defaults->stringForKey("value").value_or("-1"));
     ASSERT_TRUE(value >= trial * 100 && value <= trial * 100 + 3) << value;
     EXPECT_EQ(defaults->stringForKey("other"), "kept");
@@ -89,9 +86,9 @@ TEST(CrashSafety, SettingsStayWholeWhenAWriterIsKilled) {
 // write of any writer may be lost, and no read may see an older value.
 TEST(Concurrency, WritersOfOneSuiteLoseNothing) {
   constexpr int kProcesses = 2, kThreads = 4, kWrites = 40;  // as the keys below
-  Scratch scratch;
+  const test::TempDir scratch(kDisk);
   const auto writer = [&](const std::string& key) {
-    auto d = NSUserDefaults::initWithSuiteName(kSuite, scratch.dir);
+    auto d = NSUserDefaults::initWithSuiteName(kSuite, scratch.path());
     for (int n = 1; n <= kWrites; ++n)
       if (!d || !d->setObject(std::to_string(n), key) || d->stringForKey(key) != std::to_string(n))
         return false;
@@ -110,7 +107,7 @@ TEST(Concurrency, WritersOfOneSuiteLoseNothing) {
   for (auto& t : threads) t.join();
   EXPECT_EQ(ok, std::vector<char>(kThreads, 1));
   for (pid_t pid : children) EXPECT_TRUE(exitedCleanly(pid));
-  auto d = NSUserDefaults::initWithSuiteName(kSuite, scratch.dir);
+  auto d = NSUserDefaults::initWithSuiteName(kSuite, scratch.path());
   for (const char* key : {"process0", "process1", "thread0", "thread1", "thread2", "thread3"})
     EXPECT_EQ(d->stringForKey(key), std::to_string(kWrites)) << key;
 }

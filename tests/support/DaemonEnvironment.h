@@ -1,6 +1,11 @@
-// The environment the daemon is started with on a simulated device: this
-// process's own, without anything of the daemon's that it may carry.
+// The project's programs started on a simulated device: their environment
+// (this process's own, without anything of the daemon's that it may carry)
+// and their start.
 #pragma once
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/wait.h>
 
 #include <filesystem>
 #include <optional>
@@ -36,5 +41,32 @@ class DaemonEnvironment {
   std::vector<std::string> strings_;
   std::vector<char*> pointers_;
 };
+
+// Starts `argv` (its first word an absolute path) with `env`, its standard
+// input, output and error opened on `files` (an empty one is inherited), in
+// `dir` when given; its pid, or -1.
+inline pid_t spawnProgram(std::vector<std::string> argv, const DaemonEnvironment& env,
+                          const std::filesystem::path (&files)[3],
+                          const std::filesystem::path& dir = {}) {
+  std::vector<char*> pointers;
+  for (auto& s : argv) pointers.push_back(s.data());
+  pointers.push_back(nullptr);
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  for (int fd = 0; fd < 3; ++fd)
+    if (!files[fd].empty())
+      posix_spawn_file_actions_addopen(&actions, fd, files[fd].c_str(),
+                                       fd == 0 ? O_RDONLY : O_WRONLY | O_CREAT | O_TRUNC, 0644);
+  if (!dir.empty()) posix_spawn_file_actions_addchdir_np(&actions, dir.c_str());
+  pid_t pid = -1;
+  if (posix_spawn(&pid, pointers[0], &actions, nullptr, pointers.data(), env.envp()) != 0) pid = -1;
+  posix_spawn_file_actions_destroy(&actions);
+  return pid;
+}
+
+// A waitpid status as a shell reports it: the exit status, or 128 + the signal.
+inline int exitCode(int status) {
+  return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}
 
 }  // namespace kolvrand::test

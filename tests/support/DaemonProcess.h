@@ -1,22 +1,20 @@
 // The real kolvrand binary run on a simulated device, its stderr in a file.
 #pragma once
 
-#include <fcntl.h>
 #include <signal.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <filesystem>
-#include <fstream>
-#include <regex>
+#include <functional>
 #include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include "tests/support/DaemonEnvironment.h"
+#include "tests/support/Files.h"
 
 namespace kolvrand::test {
 
@@ -31,24 +29,15 @@ class DaemonProcess {
   DaemonProcess(const std::filesystem::path& device, const std::string& logLevel = "debug",
                 std::vector<std::string> launcher = {}, std::vector<std::string> args = {})
       : stderrPath_(device / "daemon.stderr"), stdoutPath_(device / "daemon.stdout") {
-    const DaemonEnvironment env(device, logLevel);
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, 2, stderrPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
-                                     0644);
-    posix_spawn_file_actions_addopen(&actions, 1, stdoutPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
-                                     0644);
-    launcher.push_back(daemonBinary().string());
-    launcher.insert(launcher.end(), args.begin(), args.end());
     // A previous run's stderr must not be read as this one's: posix_spawn may
     // return before the child has opened the file (it does under qemu-user).
     std::filesystem::remove(stderrPath_);
     std::filesystem::remove(stdoutPath_);
-    std::vector<char*> argv;
-    for (auto& s : launcher) argv.push_back(s.data());
-    argv.push_back(nullptr);
-    running_ = posix_spawn(&pid_, argv[0], &actions, nullptr, argv.data(), env.envp()) == 0;
-    posix_spawn_file_actions_destroy(&actions);
+    launcher.push_back(daemonBinary().string());
+    launcher.insert(launcher.end(), args.begin(), args.end());
+    pid_ =
+        spawnProgram(launcher, DaemonEnvironment(device, logLevel), {{}, stdoutPath_, stderrPath_});
+    running_ = pid_ > 0;
   }
   ~DaemonProcess() {
     if (running_) {
@@ -59,7 +48,6 @@ class DaemonProcess {
   DaemonProcess(const DaemonProcess&) = delete;
   DaemonProcess& operator=(const DaemonProcess&) = delete;
 
-  bool running() const { return running_; }
   pid_t pid() const { return pid_; }
   void signal(int sig) const {
     if (running_) kill(pid_, sig);
@@ -67,20 +55,15 @@ class DaemonProcess {
 
   // Its exit status, or -1 when it did not exit within the timeout.
   int waitForExit(std::chrono::seconds timeout = std::chrono::seconds(10)) {
-    auto deadline = std::chrono::steady_clock::now() + timeout;
-    while (std::chrono::steady_clock::now() < deadline) {
-      int status = 0;
-      if (running_ && waitpid(pid_, &status, WNOHANG) == pid_) {
-        running_ = false;
-        return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-      }
-      std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    return -1;
+    int status = 0;
+    if (!poll(timeout, [&] { return running_ && waitpid(pid_, &status, WNOHANG) == pid_; }))
+      return -1;
+    running_ = false;
+    return exitCode(status);
   }
 
-  std::string rawStderr() const { return readAll(stderrPath_); }
-  std::string rawStdout() const { return readAll(stdoutPath_); }
+  std::string rawStderr() const { return readFile(stderrPath_); }
+  std::string rawStdout() const { return readFile(stdoutPath_); }
 
   // Lines as "LEVEL [category] text"; false when a line lacks the exact
   // "kolvrand[PID]: " prefix.
@@ -102,22 +85,20 @@ class DaemonProcess {
   // Waits until a line contains one of `texts`.
   bool waitForLine(std::initializer_list<std::string_view> texts,
                    std::chrono::seconds timeout = std::chrono::seconds(10)) const {
-    auto deadline = std::chrono::steady_clock::now() + timeout;
-    while (std::chrono::steady_clock::now() < deadline) {
-      std::string err = rawStderr();
-      for (std::string_view text : texts)
-        if (err.find(text) != std::string::npos) return true;
-      std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    return false;
+    return poll(timeout, [&] {
+      const std::string err = rawStderr();
+      return std::ranges::any_of(texts, [&](auto text) { return err.find(text) != err.npos; });
+    });
   }
 
  private:
-  static std::string readAll(const std::filesystem::path& path) {
-    std::ifstream in(path);
-    std::stringstream s;
-    s << in.rdbuf();
-    return s.str();
+  // Whether `done` became true within `timeout`, asked every 10 ms.
+  static bool poll(std::chrono::seconds timeout, const std::function<bool()>& done) {
+    const auto deadline = std::chrono::steady_clock::now() + timeout;
+    for (; std::chrono::steady_clock::now() < deadline;
+         std::this_thread::sleep_for(std::chrono::milliseconds(10)))
+      if (done()) return true;
+    return false;
   }
 
   std::filesystem::path stderrPath_, stdoutPath_;

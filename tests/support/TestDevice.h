@@ -12,6 +12,7 @@
 
 #include "platform/Backend.h"
 #include "platform/Log.h"
+#include "tests/support/Files.h"
 
 namespace kolvrand::test {
 
@@ -58,8 +59,6 @@ inline nlohmann::json defaultDeviceJSON() {
 class TestDevice {
  public:
   explicit TestDevice(const nlohmann::json& device = defaultDeviceJSON()) {
-    char pattern[] = "/tmp/kolvrand-test.XXXXXX";
-    dir_ = mkdtemp(pattern);
     writeDeviceJSON(device);
     capture_ = std::make_shared<LogCapture>();
     setLogSink(capture_);
@@ -70,26 +69,22 @@ class TestDevice {
     platform::setBackend(nullptr);
     setLogSink(nullptr);
     setLogLevelSpec("");
-    std::error_code ec;
-    std::filesystem::remove_all(dir_, ec);
   }
   TestDevice(const TestDevice&) = delete;
   TestDevice& operator=(const TestDevice&) = delete;
 
-  const std::filesystem::path& dir() const { return dir_; }
+  const std::filesystem::path& dir() const { return dir_.path(); }
   void writeDeviceJSON(const nlohmann::json& device) {
-    std::ofstream(dir_ / "device.json") << device.dump(2);
+    writeFile(dir() / "device.json", device.dump(2));
   }
   // Reads device.json again, as a new start of the daemon does.
-  void reload() { platform::setBackend(platform::makeSimulatedDevice(dir_)); }
+  void reload() { platform::setBackend(platform::makeSimulatedDevice(dir())); }
 
   // Puts `bytes` at Library/KVR/BatteryModels/RELATIVE.
   void installModel(const std::string& relative, const std::string& bytes) {
-    auto path = dir_ / "Library/KVR/BatteryModels" / relative;
-    std::filesystem::create_directories(path.parent_path());
-    std::ofstream(path, std::ios::binary) << bytes;
+    writeFile(dir() / "Library/KVR/BatteryModels" / relative, bytes);
   }
-  std::filesystem::path statePath() const { return dir_ / "state/com.tesvar.kolvrand.json"; }
+  std::filesystem::path statePath() const { return dir() / "state/com.tesvar.kolvrand.json"; }
   nlohmann::json state() const {
     std::ifstream in(statePath());
     if (!in) return nlohmann::json::object();
@@ -100,7 +95,7 @@ class TestDevice {
   void clearLog() { capture_->clear(); }
 
  private:
-  std::filesystem::path dir_;
+  TempDir dir_;
   std::shared_ptr<LogCapture> capture_;
 };
 

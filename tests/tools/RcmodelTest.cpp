@@ -21,9 +21,9 @@ namespace kolvrand {
 namespace {
 
 namespace fs = std::filesystem;
-using test::readWhole;
+using test::readFile;
 using test::ToolRun;
-using test::writeWhole;
+using test::writeFile;
 
 bool matches(const std::string& text, const std::string& pattern) {
   return std::regex_search(text, std::regex(pattern));
@@ -42,13 +42,13 @@ class Rcmodel : public ::testing::Test {
   // record builder refuses, "empty" an empty file, "j" wrong JSON.
   void SetUp() override {
     const std::string good = exampleFile();
-    writeWhole(s / "good", good);
-    writeWhole(s / "cut", good.substr(0, good.size() / 2));
-    writeWhole(s / "short", exampleFile([](OTAParamRC& m) { m.setR0(nullptr); }));
-    writeWhole(s / "empty", "");
-    writeWhole(s / "j", "{\"chemID\": 1, \"gridOCV\": [0.5, \"high\"]}");
+    writeFile(s / "good", good);
+    writeFile(s / "cut", good.substr(0, good.size() / 2));
+    writeFile(s / "short", exampleFile([](OTAParamRC& m) { m.setR0(nullptr); }));
+    writeFile(s / "empty", "");
+    writeFile(s / "j", "{\"chemID\": 1, \"gridOCV\": [0.5, \"high\"]}");
     // A bare message whose last field (21, maxRdcRatio, a fixed32) breaks off.
-    writeWhole(s / "bare", std::string("\x90\x01\xe8\x42\xad\x01\x00\x00", 8));
+    writeFile(s / "bare", std::string("\x90\x01\xe8\x42\xad\x01\x00\x00", 8));
   }
   test::Scratch s;
 };
@@ -57,10 +57,10 @@ class Rcmodel : public ::testing::Test {
 // one bare message as protoc reads and writes it.
 TEST_F(Rcmodel, DecodeThenEncodeGivesTheSameFile) {
   const fs::path examples = fs::path(KOLVRAND_SOURCE_DIR) / "examples/models";
-  const std::string one = readWhole(examples / "R72/1608a.rcmodel");
-  for (const std::string& bytes : {one, one + readWhole(examples / "K517/1821.rcmodel") +
-                                            readWhole(examples / "T604/1886.rcmodel")}) {
-    writeWhole(s / "in", bytes);
+  const std::string one = readFile(examples / "R72/1608a.rcmodel");
+  for (const std::string& bytes : {one, one + readFile(examples / "K517/1821.rcmodel") +
+                                            readFile(examples / "T604/1886.rcmodel")}) {
+    writeFile(s / "in", bytes);
     EXPECT_EQ(s.rcmodel({"encode", "-", "-o", "-"}, s.rcmodel({"decode", "in"}).out).out, bytes);
   }
   const std::vector<uint8_t> data = makeExampleModel(0x1608)->data();
@@ -69,49 +69,22 @@ TEST_F(Rcmodel, DecodeThenEncodeGivesTheSameFile) {
   EXPECT_EQ(s.rcmodel({"encode", "--raw", "-", "-o", "-"}, json).out, bare);
 }
 
-// What each use returns and prints: stderr must match `err` (be empty for ""),
-// stdout `out` (be empty for ""); a command that fails writes nothing.
+// What each use returns and prints, in rcmodel_uses.json: per use (strings
+// between them are comments) the exit status, the arguments, what stderr must
+// match (be empty for ""), what stdout must match (be empty when not given),
+// and standard input; a use that fails writes nothing.
 TEST_F(Rcmodel, ExitCodesAndMessages) {
-  struct Case {
-    int status;
-    std::vector<std::string> args;
-    std::string err, out = "", input = "";
-  } const cases[] = {
-      {2, {}, "^usage: rcmodel COMMAND"},
-      {0, {"--help"}, "", "^usage: rcmodel COMMAND[\\s\\S]*decode[\\s\\S]*status"},
-      {0, {"status", "--help"}, "", "^usage: rcmodel status\n"},
-      {2, {"frobnicate"}, "^rcmodel: unknown command \"frobnicate\"; run rcmodel --help"},
-      {2, {"plot", "-x"}, "^rcmodel plot: unknown option -x; see rcmodel plot --help\n$"},
-      // Each command's own check of its operands.
-      {2, {"decode"}, "give one model file"},
-      {2, {"encode", "-"}, "give the model file to write with -o FILE"},
-      {2, {"record"}, "give one model file"},
-      {2, {"validate"}, "give at least one model file"},
-      {2, {"plot", "good"}, "give the picture to write with -o OUT.svg"},
-      {2, {"status", "extra"}, "status takes no file"},
-      {1, {"decode", "no"}, "no: cannot open: No such file.*; give the path of a model file\n$"},
-      {1, {"decode", "cut"}, "^rcmodel decode: cut: message 0 at offset 0 claims .*use --raw\n$"},
-      {1, {"decode", "empty"}, "^rcmodel decode: empty: holds no message"},
-      // A bare message may be empty; of one that breaks off, what was read is
-      // printed.
-      {0, {"decode", "--raw", "empty"}, "", "^\\{.*\"chemID\":0"},
-      {1, {"decode", "--raw", "bare"}, "breaks off at byte 6 of 8", "\"chemID\":8552"},
-      // The JSON path of the wrong value, and how to write what was meant.
-      {2, {"encode", "j", "-o", "out"}, "j: \\$.gridOCV\\[1\\]: expected a float.*\"-Infinity\""},
-      {2, {"encode", "-", "-o", "out"}, "^rcmodel encode: stdin: \\$: holds no model", "", "[]"},
-      {2, {"encode", "no", "-o", "out"}, "^rcmodel encode: no: cannot open"},
-      {0, {"record", "good"}, "", "^[0-9a-f]{40}\n$"},
-      // The daemon's own reasons, then what to do.
-      {1, {"record", "short", "-o", "out"}, "R0 nil: .*\n.*short: the daemon would refuse"},
-      {1, {"record", "empty"}, "protobufModelRCParams nil\n.*empty: the daemon cannot load this"},
-      {1, {"plot", "cut", "-o", "out"}, "cut: message 0"},
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(testing::PrintToString(c.args));
-    ToolRun run = s.rcmodel(c.args, c.input);
-    EXPECT_EQ(run.status, c.status) << run.err;
-    EXPECT_TRUE(c.err.empty() ? run.err.empty() : matches(run.err, c.err)) << run.err;
-    EXPECT_TRUE(matches(run.out, c.out.empty() ? "^$" : c.out)) << run.out;
+  const auto uses =
+      nlohmann::json::parse(readFile(KOLVRAND_SOURCE_DIR "/tests/tools/rcmodel_uses.json"));
+  for (const auto& use : uses) {
+    if (use.is_string()) continue;
+    SCOPED_TRACE(use.dump());
+    const auto text = [&](size_t i) { return use.size() > i ? use[i].get<std::string>() : ""; };
+    const std::string err = text(2), out = text(3);
+    ToolRun run = s.rcmodel(use[1].get<std::vector<std::string>>(), text(4));
+    EXPECT_EQ(run.status, use[0].get<int>()) << run.err;
+    EXPECT_TRUE(err.empty() ? run.err.empty() : matches(run.err, err)) << run.err;
+    EXPECT_TRUE(matches(run.out, out.empty() ? "^$" : out)) << run.out;
     EXPECT_FALSE(fs::exists(s / "out"));
   }
 }
@@ -124,7 +97,7 @@ TEST_F(Rcmodel, ExitCodesAndMessages) {
 // line says why.
 TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
   fs::permissions(s / ".", fs::perms(0755));
-  writeWhole(s / "m.json", "{\"chemID\": 8552}");
+  writeFile(s / "m.json", "{\"chemID\": 8552}");
   fs::create_symlink("target", s / "link");
   // What /dev/stdout is; the real one is not named, since a fault that
   // replaced the link itself would replace it for the whole machine.
@@ -132,7 +105,7 @@ TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
   ASSERT_EQ(mkfifo((s / "fifo").c_str(), 0644), 0);
   // root may write anywhere, so the write that must fail runs as nobody.
   fs::create_directory(s / "ro");
-  writeWhole(s / "ro/out", "old");
+  writeFile(s / "ro/out", "old");
   fs::permissions(s / "ro", fs::perms(0555));
   std::vector<std::string> asUser;
   if (geteuid() == 0)
@@ -145,30 +118,30 @@ TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
       return s.rcmodel({command, in, "-o", out}, "", "", launcher);
     };
     ASSERT_EQ(run("plain").status, 0);
-    const std::string expected = readWhole(s / "plain");
+    const std::string expected = readFile(s / "plain");
     EXPECT_EQ(run("-").out, expected);
     // Written into the descriptor: the file the harness opened gets the
     // bytes, rather than a new file under its name.
     fs::remove(s / "seen");
     fs::create_hard_link(s / ".stdout", s / "seen");
     EXPECT_EQ(run("stdout").out, expected);
-    EXPECT_EQ(readWhole(s / "seen"), expected);
+    EXPECT_EQ(readFile(s / "seen"), expected);
 
     fs::remove(s / "target");
     EXPECT_EQ(run("link").status, 0) << "dangling";
     // The file the link ends at is replaced by a new one (its old content
     // stays behind a hard link) with its old mode.
-    writeWhole(s / "target", "old");
+    writeFile(s / "target", "old");
     fs::permissions(s / "target", fs::perms(0640));
     fs::create_hard_link(s / "target", s / (std::string("hard.") + command));
     EXPECT_EQ(run("link").status, 0);
     EXPECT_TRUE(fs::is_symlink(s / "link"));
-    EXPECT_EQ(readWhole(s / "target"), expected);
-    EXPECT_EQ(readWhole(s / (std::string("hard.") + command)), "old");
+    EXPECT_EQ(readFile(s / "target"), expected);
+    EXPECT_EQ(readFile(s / (std::string("hard.") + command)), "old");
     EXPECT_EQ(fs::status(s / "target").permissions(), fs::perms(0640));
 
     std::string heard;
-    std::thread reader([&] { heard = readWhole(s / "fifo"); });
+    std::thread reader([&] { heard = readFile(s / "fifo"); });
     EXPECT_EQ(run("fifo").status, 0);
     reader.join();
     EXPECT_EQ(heard, expected);
@@ -181,7 +154,7 @@ TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
       EXPECT_TRUE(matches(refused.err, std::string("^rcmodel [a-z]+: ") + out + ": " + why + "\n$"))
           << refused.err;
     }
-    EXPECT_EQ(readWhole(s / "ro/out"), "old");
+    EXPECT_EQ(readFile(s / "ro/out"), "old");
   }
   fs::permissions(s / "ro", fs::perms(0755));
 }
@@ -262,12 +235,12 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
 
   runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
                       BatteryModelDataHandler::init().get());
-  const std::string uploaded = readWhole(device.dir() / "driver/battery_params.bin");
+  const std::string uploaded = readFile(device.dir() / "driver/battery_params.bin");
   const SHA1Digest digest = sha1(uploaded.data(), uploaded.size());
   EXPECT_EQ(record, hexString(digest.data(), digest.size()));
   EXPECT_EQ(s.rcmodel({"record", model.string(), "-o", "record.bin"}).out, record + "\n");
-  EXPECT_EQ(readWhole(s / "record.bin"), uploaded);
-  const std::string state = readWhole(device.statePath());
+  EXPECT_EQ(readFile(s / "record.bin"), uploaded);
+  const std::string state = readFile(device.statePath());
   EXPECT_EQ(verdict(), "loaded") << report;
   EXPECT_EQ(field("driver's hash"), record);
   EXPECT_EQ(field("saved boot session"),
@@ -304,7 +277,7 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
                       "createKextModelFromProtobufModel:\\] <Error> gridOCV holds 0 elements, the "
                       "record carries 303\n"))
       << report;
-  EXPECT_EQ(readWhole(device.statePath()), state);
+  EXPECT_EQ(readFile(device.statePath()), state);
 }
 
 }  // namespace
