@@ -43,18 +43,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
 
   if (messages->empty()) return 0;
   // A model that fills the record goes on to the builder, whose copies the
-  // count checks must keep in bounds. Of the others, which the builder only
-  // refuses, line by line (the unit tests pin those lines), one in eight goes
-  // too: formatting the refusals would otherwise take most of the run.
+  // count checks must keep in bounds (AddressSanitizer watches them). Of the others, which the
+  // builder only refuses, line by line (the unit tests pin those lines), one in eight goes too:
+  // formatting the refusals would otherwise take most of the run.
   const OTAParamRC& model = *messages->front();
-  bool fills = true;
-  for (const KextTableSource& t : kextTableSources()) {
-    const OTAResistanceData* table = t.table(model);
-    for (const KextTableListSource& l : kextTableListSources())
-      fills = fills && table && l.elements(*table).size() >= l.count;
-  }
-  for (const KextListSource& l : kextListSources())
-    fills = fills && l.elements(model).size() >= l.count;
+  const bool fills = std::ranges::all_of(checkKextLists(model), &KextListCheck::fills);
   if (!fills && size % 8 != 0) return 0;
 
   auto record = handler->createKextModelFromProtobufModel(&model);

@@ -107,11 +107,8 @@ TEST(Daemon, DeviceTypeThatIsNoDirectoryNameNamesNoFile) {
     device.writeDeviceJSON(j);
     const std::string model = test::readFile(device.models() / "T618e/2168.rcmodel");
     for (const fs::path& dir : {device.models(), device.models() / "a/b", device.dir() / "x",
-                                device.dir() / "Library/KVR"}) {
-      fs::create_directories(dir);
+                                device.dir() / "Library/KVR"})
       test::writeFile(dir / "1234.rcmodel", model);
-    }
-    fs::create_directories(device.statePath().parent_path());
     test::writeFile(device.statePath(), json{{"savedBootUUID", kOld}}.dump());
 
     const std::string handler = "error [batteryModelDataHandling] -[BatteryModelDataHandler ";

@@ -4,8 +4,6 @@
 // defaults. (An unreadable boot session is crossed by the daemon's runs.)
 #include <gtest/gtest.h>
 
-#include <fstream>
-
 #include "daemon/BatteryAgingActivity.h"
 #include "daemon/BatteryModelTask.h"
 #include "pipeline/DaemonIdentifier.h"
@@ -63,7 +61,7 @@ TEST(BatteryModelTask, FailsWithoutAHandlerOrDefaults) {
 
   device.clearLog();
   std::filesystem::remove_all(device.dir() / "state");
-  std::ofstream(device.dir() / "state") << "not a directory";
+  test::writeFile(device.dir() / "state", "not a directory");
   runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
                       BatteryModelDataHandler::init().get());
   const Lines lines = device.logLines();

@@ -7,6 +7,7 @@
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/PBStreamReader.h"
 #include "platform/Sysctl.h"
+#include "tests/support/Files.h"
 #include "tests/support/ModelFiles.h"
 #include "tests/support/TestDevice.h"
 
@@ -17,37 +18,16 @@ using Lines = std::vector<std::string>;
 using nlohmann::json;
 
 const std::string kHandler = "[batteryModelDataHandling] ";
-const std::string kInt =
-    "error " + kHandler + "-[BatteryModelDataHandler getIntValueForKeyFromBatteryData:] <Error> ";
-const std::string kSuffix =
-    "error " + kHandler +
-    "-[BatteryModelDataHandler getSpecialCaseBatteryModelIdentifier:] <Error> ";
 
 // The chem ID with its one replacement, stored as read; and the serial-number
-// suffix of the model file's name, which only chem ID 5640 has. Null battery data takes the battery
-// driver away, "absent" only its data.
+// suffix of the model file's name, which only chem ID 5640 has. The cases are
+// in identity_cases.json.
 TEST(BatteryIdentity, ChemIDAndSerialNumberSuffix) {
-  const char* const kChem = "AlgoChemID";
-  const char* const kSerial = "BatterySerialNumber";
-  // battery data, chem ID, the suffix of chem ID 5640's model file, lines
-  const std::tuple<json, uint32_t, std::string, Lines> cases[] = {
-      {{{kChem, 6439}, {kSerial, "0123456789ABCDE8"}}, 8552, "b", {}},
-      {{{kChem, 8552}, {kSerial, "0123456789ABCDE8Z"}}, 8552, "b", {}},
-      {{{kChem, 6440}, {kSerial, "0123456789ABCDE7"}}, 6440, "a", {}},
-      {{{kChem, 0}, {kSerial, "0123456789ABCD8"}}, 0, "a", {}},
-      {{{kChem, -1}, {kSerial, ""}}, 0xFFFFFFFF, "a", {}},
-      // A value wider than 32 bits keeps its low 32 bits, 6439, read as 8552;
-      // 18 bytes do not fit with their NUL: read as no serial number at all.
-      {{{kChem, 0x100001927LL}, {kSerial, "0123456789ABCDE8ZZ"}}, 8552, "a", {}},
-      // Sixteen bytes whose last is the second byte of a two-byte character.
-      {{{kChem, "6439"}, {kSerial, "0123456789ABCD\xc3\xa8"}}, 0, "a", {kInt + "valueCF null"}},
-      {{{kChem, 5640}}, 5640, "", {kSuffix + "valueCF null"}},
-      {{{kSerial, 8}}, 0, "", {kInt + "valueCF null", kSuffix + "valueCF null"}},
-      {"absent", 0, "", {kInt + "batteryData null", kSuffix + "batteryData null"}},
-      {{1, 2}, 0, "", {kInt + "batteryData null", kSuffix + "batteryData null"}},
-      {nullptr, 0, "", {kInt + "powerService null", kSuffix + "powerService null"}},
-  };
-  for (const auto& [batteryData, chemID, suffix, lines] : cases) {
+  for (const json& c :
+       json::parse(test::readFile(KOLVRAND_SOURCE_DIR "/tests/pipeline/identity_cases.json"))) {
+    if (c.is_string()) continue;
+    const json& batteryData = c[0];
+    const uint32_t chemID = c[1];
     SCOPED_TRACE(batteryData.dump());
     json device = test::defaultDeviceJSON();
     auto& battery = device["registry"]["TesvarSmartBattery"];
@@ -57,12 +37,12 @@ TEST(BatteryIdentity, ChemIDAndSerialNumberSuffix) {
     test::TestDevice testDevice(device);
     auto handler = BatteryModelDataHandler::init();
     EXPECT_EQ(handler->getBatteryChemID(), chemID);
-    EXPECT_EQ(
-        handler->getBatteryModelFilePath(5640),
-        (testDevice.dir() / "Library/KVR/BatteryModels/R72/1608").string() + suffix + ".rcmodel");
+    EXPECT_EQ(handler->getBatteryModelFilePath(5640),
+              (testDevice.dir() / "Library/KVR/BatteryModels/R72/1608").string() +
+                  c[2].get<std::string>() + ".rcmodel");
     // Any other chem ID never looks at the registry.
     EXPECT_EQ(handler->getSpecialCaseBatteryModelIdentifier(5641), "");
-    EXPECT_EQ(testDevice.logLines(), lines);
+    EXPECT_EQ(testDevice.logLines(), c[3].get<Lines>());
     EXPECT_EQ(testDevice.state()["savedChemID"], chemID);
   }
 }

@@ -3,7 +3,6 @@
 // driver holds afterwards and that "savedBootUUID" is untouched.
 #include <gtest/gtest.h>
 
-#include <fstream>
 #include <map>
 
 #include "daemon/BatteryModelTask.h"
@@ -56,8 +55,7 @@ TEST(Transfer, EachOutcomeLeavesItsChainTheDriverAndTheMark) {
     const fs::path path = device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel";
     if (const auto& file = files.at(c.value("model", "example")))
       device.installModel("T618e/2168.rcmodel", *file);
-    fs::create_directories(device.statePath().parent_path());
-    std::ofstream(device.statePath()) << R"({"savedBootUUID": "previous-session"})";
+    test::writeFile(device.statePath(), R"({"savedBootUUID": "previous-session"})");
     device.clearLog();
     runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
                         BatteryModelDataHandler::init().get());

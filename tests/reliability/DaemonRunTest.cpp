@@ -36,7 +36,6 @@ const std::string kExample = readFile(fs::path(KOLVRAND_SOURCE_DIR) / "examples/
 struct ExampleDevice {
   ExampleDevice() {
     fs::copy(fs::path(KOLVRAND_SOURCE_DIR) / "examples/device", dir, fs::copy_options::recursive);
-    fs::create_directory(path("state"));
     writeFile(path(kState), kEarlierState.dump(2));
   }
   fs::path path(const fs::path& relative) const { return dir / relative; }

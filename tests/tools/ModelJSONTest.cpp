@@ -6,9 +6,11 @@
 #include <bit>
 #include <cfloat>
 #include <limits>
+#include <nlohmann/json.hpp>
 #include <random>
 
 #include "model/OTAParamRC.h"
+#include "tests/support/Files.h"
 #include "tools/example_models/ExampleModel.h"
 #include "tools/rcmodel/ModelJSON.h"
 
@@ -93,51 +95,18 @@ TEST(ModelJSON, EachTextGivesItsModelOrThePathOfTheFirstWrongValue) {
   std::string deep = "$";
   for (int i = 0; i < 64; ++i) deep += "[0]";
   struct Case {
-    std::string json, path;
-    const char* text;  // found in the model's JSON, or in the reason
+    std::string json, path, text;  // text: found in the model's JSON, or in the reason
     bool single = false;
   };
-  std::vector<Case> cases = {
-      // Floats are the shortest text that reads back ("-0" would read back as
-      // the integer 0) and numbers round to the nearest float once: the last
-      // two just below and above the midpoint between 1 and the next float.
-      {"{\"gridOCV\":[0.1, 1.0, -0.0, 1e-45, \"NaN\", \"Infinity\", \"-Infinity\", 3.4028235e38]}",
-       "", "\"gridOCV\":[0.1,1,-0.0,1e-45,\"NaN\",\"Infinity\",\"-Infinity\",3.4028235e+38]"},
-      {"{\"gridOCV\":[3, 16777217, 1e-50, 1.00000005960464477539062499, "
-       "1.00000005960464477539062501]}",
-       "", "\"gridOCV\":[3,16777216,0,1,1.0000001]"},
-      // The enum takes its names, the unknown form and integers.
-      {"{\"MLBConfig\":\"kKVRNorthSouthSplitMLB\"}", "", ":\"kKVRNorthSouthSplitMLB\""},
-      {"{\"MLBConfig\":\"(unknown: -2147483648)\"}", "", ":\"(unknown: -2147483648)\""},
-      {"{\"MLBConfig\":-1}", "", "\"MLBConfig\":\"(unknown: -1)\""},
-      {"{\"MLBConfig\":2147483647}", "", "\"MLBConfig\":\"(unknown: 2147483647)\""},
-      {"{\"R0x\": []}", "$.R0x", "unknown key"},
-      {"{\"r0\": {}}", "$.r0", "did you mean \"R0\""},
-      // A number beyond its field's range is shown as it was written.
-      {"{\"chemID\": -1}", "$.chemID", "-1 is out of range"},
-      {"{\"chemID\": 4294967296}", "$.chemID", "4294967296 is out of range"},
-      {"{}\n{\"gridOCV\": [1, 1E39]}", "line 2: $.gridOCV[1]", "1E39 is out of range for a 32-bit"},
-      {"{\"chemID\": 2.5}", "$.chemID", "expected an unsigned 32-bit integer"},
-      {"{\"chemID\": \"1\"}", "$.chemID", "got the string \"1\""},
-      {"{\"gridOCV\": 1}", "$.gridOCV", "expected an array of floats"},
-      {"{\"maxRdcRatio\": [1]}", "$.maxRdcRatio", "expected a float, got an array"},
-      {"{\"R0\": []}", "$.R0", "expected an object (OTAResistanceData)"},
-      {"{\"R0\": {\"resistance25C\": [0, null]}}", "$.R0.resistance25C[1]", "null"},
-      {"[{}, {\"bmuResistance\": {\"bogus\": 1}}]", "$[1].bmuResistance.bogus", "unknown key"},
-      {"[{}, 3]", "$[1]", "expected an object"},
-      {"{}\n[]", "line 2: $", "expected an object (one model) on each line"},
-      {"[]", "$", "holds no model"},
-      {"[{}]", "$", "expected one object", true},
-      {"{}\n{}\n", "$", "got line 2 after it", true},
-      {"{\"chemID\": 1, \"chemID\": 2}", "$.chemID", "twice"},
-      {"", "$", "not valid JSON"},
-      // Nothing may follow the JSON, not even behind a NUL byte; syntax errors
-      // name their line and column in the whole text.
-      {std::string("{}\n\0{\"chemID\": 1}", 16), "$", "a NUL byte at line 2, column 1"},
-      {"{} x", "$", "at line 1, column 4: syntax error"},
-      {"{}\n{}\n\n{\"chemID\": x}\n", "$", "at line 4, column 12: syntax error"},
-      {std::string(100000, '[') + std::string(100000, ']'), deep, "nested deeper than 64"},
-  };
+  // model_json_cases.json holds the cases (strings between them are
+  // comments) as [json, path, text, single].
+  std::vector<Case> cases;
+  for (const auto& c : nlohmann::json::parse(
+           test::readFile(KOLVRAND_SOURCE_DIR "/tests/tools/model_json_cases.json")))
+    if (c.is_array()) cases.push_back({c[0], c[1], c[2], c.size() > 3 && c[3].get<bool>()});
+  cases.push_back(
+      {std::string(100000, '[') + std::string(100000, ']'), deep, "nested deeper than 64"});
+
   // Of an enum, only the text the dictionary would show for a value is taken.
   for (const char* json : {"\"(unknown: 0)\"", "\"(unknown: 07)\"", "\"(unknown: 2147483648)\"",
                            "\"(unknown: )\"", "\"kkvrregularmlb\"", "2147483648", "1.5", "true"})
