@@ -31,7 +31,9 @@ int main() {
                           if (xpc_activity_get_state(a) != XPC_ACTIVITY_STATE_RUN) return;
                           dispatch_async(queue, [] {
                             say("started");
-                            std::this_thread::sleep_for(std::chrono::milliseconds(300));
+                            // Long enough for the test's SIGINT to arrive
+                            // meanwhile, however slowly an emulator runs.
+                            std::this_thread::sleep_for(std::chrono::seconds(2));
                             say("finished");
                           });
                           dispatch_async(queue, [] { say("dropped"); });
