@@ -1,3 +1,5 @@
+# SPDX-License-Identifier: MIT
+#
 # Shared by the scripts: install what is missing, configure and build.
 # shellcheck shell=bash
 
