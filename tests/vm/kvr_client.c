@@ -10,7 +10,8 @@
  *
  * MODEL_DIR is the node's battery_model attribute directory. One line a
  * check on stdout: "VMTEST check NAME pass|fail WHAT"; exit status 1 when
- * any check failed.
+ * any check failed. Built for i386 too, it makes the same calls through the
+ * kernel's 32-bit compat path; its check names then end in "_32".
  */
 #define _GNU_SOURCE
 #include <errno.h>
@@ -40,7 +41,8 @@ static void report(const char *name, bool pass, const char *fmt, ...)
 {
 	va_list ap;
 
-	printf("VMTEST check %s %s ", name, pass ? "pass" : "fail");
+	printf("VMTEST check %s%s %s ", name, sizeof(void *) == 4 ? "_32" : "",
+	       pass ? "pass" : "fail");
 	va_start(ap, fmt);
 	vprintf(fmt, ap);
 	va_end(ap);
@@ -132,7 +134,8 @@ static int send_file(const char *node, const char *path)
 	}
 	err = call(node, O_RDWR, TESVAR_KVR_IOC_CALL_STRUCT,
 		   TESVAR_KVR_SET_BATTERY_PARAMS, len, record);
-	report("record_sent_by_client", err == 0, "%zu bytes: %s", len, err ? strerror(err) : "accepted");
+	report("record_sent_by_client", err == 0, "%zu bytes: %s", len,
+	       err ? strerror(err) : "accepted");
 	free(record);
 	return err != 0;
 }
