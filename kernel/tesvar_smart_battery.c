@@ -77,6 +77,7 @@ static const struct kernel_param_ops chem_id_ops = {
 	.get = chem_id_get,
 };
 module_param_cb(chem_id, &chem_id_ops, NULL, 0644);
+__MODULE_PARM_TYPE(chem_id, "uint");
 MODULE_PARM_DESC(chem_id, "battery chemistry ID (algo_chem_id), default 8552");
 
 static int serial_number_set(const char *val, const struct kernel_param *kp)
@@ -110,6 +111,7 @@ static const struct kernel_param_ops serial_number_ops = {
 	.get = serial_number_get,
 };
 module_param_cb(serial_number, &serial_number_ops, NULL, 0644);
+__MODULE_PARM_TYPE(serial_number, "string");
 MODULE_PARM_DESC(serial_number, "battery serial number, at most 31 characters");
 
 static enum power_supply_property tesvar_battery_props[] = {
