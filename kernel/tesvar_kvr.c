@@ -40,7 +40,7 @@
 struct tesvar_kvr {
 	struct miscdevice misc;
 	struct crypto_shash *sha1;
-	/* Serialises callers and guards everything below. */
+	/* Serialises the callers' commits and guards everything below. */
 	struct mutex lock;
 	void *params;		/* the kept record, or NULL before the first */
 	u8 params_hash[TESVAR_KVR_PARAMS_HASH_SIZE];
