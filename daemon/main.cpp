@@ -11,6 +11,7 @@
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "platform/Activity.h"
+#include "platform/Backend.h"
 #include "platform/Dispatch.h"
 #include "platform/Log.h"
 
@@ -55,6 +56,10 @@ std::optional<int> answerArguments(int argc, char** argv) {
 int main(int argc, char** argv) {
   using namespace kolvrand;
   if (std::optional<int> status = answerArguments(argc, argv)) return *status;
+  if (std::optional<std::string> error = platform::deviceSelectionError()) {
+    std::fprintf(stderr, "kolvrand: %s\n", error->c_str());
+    return 1;
+  }
 
   os_log_t mainLog = os_log_create(DaemonIdentifier, "main");
 

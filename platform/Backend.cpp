@@ -25,16 +25,23 @@ Slot& slot() {
 
 std::shared_ptr<Backend> chooseBackend() {
   const char* device = std::getenv("KOLVRAND_DEVICE");
-  if (device && *device) {
-    std::error_code ec;
-    if (std::filesystem::is_directory(device, ec)) return makeSimulatedDevice(device);
-    os_log_error(platformLog("platform"), "KOLVRAND_DEVICE %s is not a directory; using the host\n",
-                 device);
-  }
-  return makeHostBackend();
+  if (!device || !*device) return makeHostBackend();
+  // Callers have refused a device that is no directory; should one get here
+  // anyway, it meets a device with nothing on it, never the host.
+  if (auto error = deviceSelectionError()) os_log_error(platformLog("platform"), "%s\n", *error);
+  return makeSimulatedDevice(device);
 }
 
 }  // namespace
+
+std::optional<std::string> deviceSelectionError() {
+  const char* device = std::getenv("KOLVRAND_DEVICE");
+  if (!device || !*device) return std::nullopt;
+  std::error_code ec;
+  if (std::filesystem::is_directory(device, ec)) return std::nullopt;
+  return std::string("KOLVRAND_DEVICE ") + device + " is not a directory" +
+         (ec && ec != std::errc::no_such_file_or_directory ? ": " + ec.message() : "");
+}
 
 Backend& backend() {
   Slot& s = slot();

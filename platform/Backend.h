@@ -48,8 +48,13 @@ class Backend {
 };
 
 // The backend in use. On first use: the simulated device when KOLVRAND_DEVICE
-// names a directory, the Linux host otherwise.
+// is set, the Linux host otherwise.
 Backend& backend();
+
+// What is wrong with KOLVRAND_DEVICE, when it is set and names no directory.
+// The daemon and rcmodel then stop before reading or writing anything: a
+// mistyped device must never end up talking to the real drivers.
+std::optional<std::string> deviceSelectionError();
 
 // Installs `b` as the backend (nullptr: choose again on next use).
 void setBackend(std::shared_ptr<Backend> b);

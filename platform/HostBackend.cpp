@@ -3,6 +3,7 @@
 #include "platform/Backend.h"
 #include "platform/IOKit.h"
 #include "platform/Internal.h"
+#include "platform/LinuxRegistry.h"
 
 namespace kolvrand::platform {
 
@@ -38,26 +39,10 @@ class HostKernelVariables final : public KernelVariables {
   }
 };
 
-// The host publishes no registry services (no battery or power-management
-// driver of this kind).
-class HostRegistry final : public Registry {
- public:
-  uint32_t findService(std::string_view) override { return 0; }
-  std::optional<Value> property(uint32_t, std::string_view) override { return std::nullopt; }
-  int32_t open(uint32_t, uint32_t, uint32_t* connection) override {
-    if (connection) *connection = 0;
-    return kIOReturnBadArgument;
-  }
-  int32_t callStructMethod(uint32_t, uint32_t, std::span<const uint8_t>) override {
-    return kIOReturnNotOpen;
-  }
-  void close(uint32_t) override {}
-};
-
 class HostBackend final : public Backend {
  public:
   KernelVariables& kernelVariables() override { return kernel_; }
-  Registry& registry() override { return registry_; }
+  Registry& registry() override { return *registry_; }
   std::filesystem::path libraryDirectory() override { return KOLVRAND_LIBRARY_DIR; }
   std::filesystem::path stateDirectory() override {
     // Set by systemd's StateDirectory=; several directories are ':'-separated.
@@ -70,7 +55,7 @@ class HostBackend final : public Backend {
 
  private:
   HostKernelVariables kernel_;
-  HostRegistry registry_;
+  std::unique_ptr<Registry> registry_ = makeLinuxRegistry();
 };
 
 }  // namespace

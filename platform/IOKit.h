@@ -24,9 +24,14 @@ using io_connect_t = uint32_t;
 inline constexpr kern_return_t KERN_SUCCESS = 0;
 inline constexpr IOReturn kIOReturnSuccess = 0;
 inline constexpr IOReturn kIOReturnError = static_cast<IOReturn>(0xe00002bc);
+inline constexpr IOReturn kIOReturnNoMemory = static_cast<IOReturn>(0xe00002bd);
+inline constexpr IOReturn kIOReturnNoDevice = static_cast<IOReturn>(0xe00002c0);
+inline constexpr IOReturn kIOReturnNotPrivileged = static_cast<IOReturn>(0xe00002c1);
 inline constexpr IOReturn kIOReturnBadArgument = static_cast<IOReturn>(0xe00002c2);
 inline constexpr IOReturn kIOReturnNotOpen = static_cast<IOReturn>(0xe00002cd);
 inline constexpr IOReturn kIOReturnUnsupported = static_cast<IOReturn>(0xe00002c7);
+inline constexpr IOReturn kIOReturnBusy = static_cast<IOReturn>(0xe00002d5);
+inline constexpr IOReturn kIOReturnAborted = static_cast<IOReturn>(0xe00002eb);
 inline constexpr mach_port_t kIOMasterPortDefault = 0;
 
 task_port_t mach_task_self();

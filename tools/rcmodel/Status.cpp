@@ -12,6 +12,7 @@
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "pipeline/KextBatteryModel.h"
+#include "platform/Backend.h"
 #include "platform/CommonCrypto.h"
 #include "platform/Defaults.h"
 #include "tools/rcmodel/Tool.h"
@@ -81,6 +82,10 @@ std::optional<Data> publishedHash(BatteryModelDataHandler& handler) {
 
 int run(const Arguments& a) {
   if (!a.operands.empty()) return usageError(a.command, "status takes no file");
+  if (std::optional<std::string> error = platform::deviceSelectionError()) {
+    std::fprintf(stderr, "rcmodel: %s\n", error->c_str());
+    return kExitFailed;
+  }
 
   auto collect = std::make_shared<Collect>();
   setLogSink(collect);
