@@ -41,6 +41,41 @@ cross_triplet() {
   esac
 }
 
+# apt_state ARCH DIR [MORE ARCHES...]: an apt state of its own in DIR that
+# reads the host's package sources for ARCH's packages (and those of MORE
+# ARCHES, named ARCH:PACKAGE), for downloading them without installing:
+# apt_opts holds the options that select it, apt_update reads the indexes.
+apt_state() {
+  local arch=$1 apt=$2
+  shift 2
+  mkdir -p "$apt/lists/partial" "$apt/archives/partial" "$apt/sources.list.d" "$apt/preferences.d"
+  : >"$apt/status"
+  # The host's package sources, read for ARCH's indexes.
+  : >"$apt/sources.list"
+  [ -f /etc/apt/sources.list ] && cp /etc/apt/sources.list "$apt/sources.list"
+  rm -f "$apt"/sources.list.d/*
+  cp /etc/apt/sources.list.d/*.list /etc/apt/sources.list.d/*.sources "$apt/sources.list.d/" 2>/dev/null || true
+  apt_opts=(-o "Dir::State=$apt" -o "Dir::State::status=$apt/status"
+    -o "Dir::Cache=$apt/cache" -o "Dir::Cache::archives=$apt/archives"
+    -o "Dir::Etc::sourcelist=$apt/sources.list" -o "Dir::Etc::sourceparts=$apt/sources.list.d"
+    -o "Dir::Etc::preferencesparts=$apt/preferences.d"
+    -o "APT::Architecture=$arch" -o "APT::Architectures::=$arch" -o Debug::NoLocking=1)
+  local more
+  for more in "$@"; do apt_opts+=(-o "APT::Architectures::=$more"); done
+}
+apt_update() {
+  # A mirror caught mid-sync serves an index that does not match its Release
+  # file: try again, and in the end go on with the indexes that did arrive
+  # (what is downloaded only has to agree with itself, not with the host).
+  local try
+  for try in 1 2 3; do
+    apt-get "${apt_opts[@]}" -qq update && return 0
+    echo "apt-get update failed (try $try of 3)" >&2
+    [ "$try" -lt 3 ] && sleep 20
+  done
+  return 0
+}
+
 # cross_sysroot ARCH DIR: installs Debian's cross compiler for ARCH and makes
 # DIR/sysroot from ARCH's own Debian packages: the libraries and headers the
 # build links against, and the C library and runtime the emulator loads the
@@ -65,30 +100,11 @@ cross_sysroot() {
   [ "$(cat "$sysroot/.packages" 2>/dev/null)" = "$(printf '%s\n' "${packages[@]}")" ] &&
     [ -f "$sysroot/DEBIAN/shlibs" ] && return 0
 
-  mkdir -p "$apt/lists/partial" "$apt/archives/partial" "$apt/sources.list.d" "$apt/preferences.d"
-  : >"$apt/status"
-  # The host's package sources, read for ARCH's indexes.
-  : >"$apt/sources.list"
-  [ -f /etc/apt/sources.list ] && cp /etc/apt/sources.list "$apt/sources.list"
-  rm -f "$apt"/sources.list.d/*
-  cp /etc/apt/sources.list.d/*.list /etc/apt/sources.list.d/*.sources "$apt/sources.list.d/" 2>/dev/null || true
-  local opts=(-o "Dir::State=$apt" -o "Dir::State::status=$apt/status"
-    -o "Dir::Cache=$apt/cache" -o "Dir::Cache::archives=$apt/archives"
-    -o "Dir::Etc::sourcelist=$apt/sources.list" -o "Dir::Etc::sourceparts=$apt/sources.list.d"
-    -o "Dir::Etc::preferencesparts=$apt/preferences.d"
-    -o "APT::Architecture=$arch" -o "APT::Architectures::=$arch" -o Debug::NoLocking=1)
+  apt_state "$arch" "$apt"
   echo "Downloading $arch packages for the sysroot: ${packages[*]} and their dependencies"
-  # A mirror caught mid-sync serves an index that does not match its Release
-  # file: try again, and in the end go on with the indexes that did arrive
-  # (the sysroot only has to agree with itself, not with the host).
-  local try
-  for try in 1 2 3; do
-    apt-get "${opts[@]}" -qq update && break
-    echo "apt-get update for $arch failed (try $try of 3)" >&2
-    [ "$try" -lt 3 ] && sleep 20
-  done
+  apt_update
   rm -f "$apt"/archives/*.deb
-  apt-get "${opts[@]}" -qq -y --no-install-recommends install --download-only "${packages[@]}" >/dev/null
+  apt-get "${apt_opts[@]}" -qq -y --no-install-recommends install --download-only "${packages[@]}" >/dev/null
   rm -rf "$sysroot"
   mkdir -p "$sysroot/DEBIAN"
   local deb control=$dir/control

@@ -6,12 +6,15 @@
  *
  *   kvr_client NODE MODEL_DIR check      the table below, then the same as
  *                                        the unprivileged user 65534
- *   kvr_client NODE MODEL_DIR send FILE  one call with FILE's bytes
+ *   kvr_client NODE MODEL_DIR send FILE  one call with FILE's bytes, placed
+ *                                        at 0xc0000000
  *
  * MODEL_DIR is the node's battery_model attribute directory. One line a
  * check on stdout: "VMTEST check NAME pass|fail WHAT"; exit status 1 when
- * any check failed. Built for i386 too, it makes the same calls through the
- * kernel's 32-bit compat path; its check names then end in "_32".
+ * any check failed. Built for a 32-bit user space too (i386, armhf), it makes
+ * the same calls through the 64-bit kernel's compat path; the environment
+ * variable VMTEST_SUFFIX, appended to every check's name, tells the runs
+ * apart.
  */
 #define _GNU_SOURCE
 #include <errno.h>
@@ -32,6 +35,13 @@
 #define PARAMS_SIZE TESVAR_KVR_BATTERY_PARAMS_SIZE
 #define NOBODY 65534
 
+/*
+ * Above 2 GiB: a 32-bit caller's pointer there has its top bit set, which a
+ * sign-extending conversion to the call's 64-bit field, in user space or in
+ * a compat layer, would spread into the upper half.
+ */
+#define HIGH_ADDRESS 0xc0000000UL
+
 static int failures;
 
 static void report(const char *name, bool pass, const char *fmt, ...)
@@ -41,7 +51,9 @@ static void report(const char *name, bool pass, const char *fmt, ...)
 {
 	va_list ap;
 
-	printf("VMTEST check %s%s %s ", name, sizeof(void *) == 4 ? "_32" : "",
+	const char *suffix = getenv("VMTEST_SUFFIX");
+
+	printf("VMTEST check %s%s %s ", name, suffix ? suffix : "",
 	       pass ? "pass" : "fail");
 	va_start(ap, fmt);
 	vprintf(fmt, ap);
@@ -126,17 +138,28 @@ static int send_file(const char *node, const char *path)
 {
 	size_t len;
 	char *record = slurp(path, &len);
+	void *high;
 	int err;
 
 	if (!record) {
 		report("record_sent_by_client", false, "%s: %s", path, strerror(errno));
 		return 1;
 	}
-	err = call(node, O_RDWR, TESVAR_KVR_IOC_CALL_STRUCT,
-		   TESVAR_KVR_SET_BATTERY_PARAMS, len, record);
-	report("record_sent_by_client", err == 0, "%zu bytes: %s", len,
-	       err ? strerror(err) : "accepted");
+	high = mmap((void *)HIGH_ADDRESS, len, PROT_READ | PROT_WRITE,
+		    MAP_PRIVATE | MAP_ANONYMOUS | MAP_FIXED_NOREPLACE, -1, 0);
+	if (high == MAP_FAILED) {
+		report("record_sent_by_client", false, "no mapping at %#lx: %s",
+		       HIGH_ADDRESS, strerror(errno));
+		free(record);
+		return 1;
+	}
+	memcpy(high, record, len);
 	free(record);
+	err = call(node, O_RDWR, TESVAR_KVR_IOC_CALL_STRUCT,
+		   TESVAR_KVR_SET_BATTERY_PARAMS, len, high);
+	report("record_sent_by_client", err == 0, "%zu bytes at %p: %s", len,
+	       high, err ? strerror(err) : "accepted");
+	munmap(high, len);
 	return err != 0;
 }
 

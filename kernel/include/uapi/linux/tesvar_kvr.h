@@ -22,8 +22,7 @@
  *
  * Errors (errno of the ioctl), each meaning one thing:
  *   EOPNOTSUPP  the selector names no method of the driver
- *   EINVAL      input_size is not the size the method takes, or a field that
- *               must be zero is not
+ *   EINVAL      input_size is not the size the method takes
  *   EFAULT      the structure or the input could not be read
  *   EPERM       the file was not opened for writing
  *   EBUSY       another call is in progress and the file is non-blocking
