@@ -4,11 +4,12 @@
  *
  * It publishes one battery, "tesvar_battery", with the standard properties of
  * the power-supply class and the chemistry ID the battery model is chosen by
- * (algo_chem_id). The chemistry ID and the serial number are module
- * parameters that may be changed while the module is loaded
+ * (algo_chem_id), and the mains supply that charges it, "tesvar_ac". The
+ * chemistry ID, the serial number and whether the mains supply is online
+ * are module parameters that may be changed while the module is loaded
  * (/sys/module/tesvar_smart_battery/parameters/), so that a rig can present
- * another battery without reloading anything; every change is announced
- * with a change uevent like a real battery's.
+ * another battery, or unplug it, without reloading anything; every change is
+ * announced with a change uevent like a real supply's.
  */
 
 #include <linux/device.h>
@@ -23,6 +24,7 @@
 
 #define TESVAR_BATTERY_DRIVER	"TesvarSmartBattery"
 #define TESVAR_BATTERY_SUPPLY	"tesvar_battery"
+#define TESVAR_AC_SUPPLY	"tesvar_ac"
 /* Room for a gauge's serial number and its NUL. */
 #define TESVAR_SERIAL_SIZE	32
 
@@ -35,7 +37,9 @@ static DEFINE_SPINLOCK(tesvar_battery_lock);
 /* 0x2168: the chemistry of the example device's battery. */
 static unsigned int chem_id = 8552;
 static char serial_number[TESVAR_SERIAL_SIZE] = "F5D2470A1B2C3D4E5";
+static bool ac_online = true;
 static struct power_supply *tesvar_battery;
+static struct power_supply *tesvar_ac;
 
 static struct platform_device *tesvar_battery_pdev;
 
@@ -44,6 +48,16 @@ static void tesvar_battery_changed_locked(void)
 	lockdep_assert_held(&tesvar_battery_lock);
 	if (tesvar_battery)
 		power_supply_changed(tesvar_battery);
+}
+
+static bool tesvar_ac_online(void)
+{
+	bool online;
+
+	spin_lock(&tesvar_battery_lock);
+	online = ac_online;
+	spin_unlock(&tesvar_battery_lock);
+	return online;
 }
 
 static int chem_id_set(const char *val, const struct kernel_param *kp)
@@ -114,6 +128,52 @@ module_param_cb(serial_number, &serial_number_ops, NULL, 0644);
 __MODULE_PARM_TYPE(serial_number, "string");
 MODULE_PARM_DESC(serial_number, "battery serial number, at most 31 characters");
 
+static int ac_online_set(const char *val, const struct kernel_param *kp)
+{
+	bool online;
+	int ret;
+
+	ret = kstrtobool(val, &online);
+	if (ret)
+		return ret;
+
+	spin_lock(&tesvar_battery_lock);
+	ac_online = online;
+	/* Plugged in or out, the battery's status changes with the mains'. */
+	if (tesvar_ac)
+		power_supply_changed(tesvar_ac);
+	tesvar_battery_changed_locked();
+	spin_unlock(&tesvar_battery_lock);
+	return 0;
+}
+
+static int ac_online_get(char *buf, const struct kernel_param *kp)
+{
+	return sysfs_emit(buf, "%c\n", tesvar_ac_online() ? 'Y' : 'N');
+}
+
+static const struct kernel_param_ops ac_online_ops = {
+	.set = ac_online_set,
+	.get = ac_online_get,
+};
+module_param_cb(ac_online, &ac_online_ops, NULL, 0644);
+__MODULE_PARM_TYPE(ac_online, "bool");
+MODULE_PARM_DESC(ac_online, "whether the mains supply is online, default Y");
+
+static enum power_supply_property tesvar_ac_props[] = {
+	POWER_SUPPLY_PROP_ONLINE,
+};
+
+static int tesvar_ac_get_property(struct power_supply *psy,
+				  enum power_supply_property psp,
+				  union power_supply_propval *val)
+{
+	if (psp != POWER_SUPPLY_PROP_ONLINE)
+		return -EINVAL;
+	val->intval = tesvar_ac_online();
+	return 0;
+}
+
 static enum power_supply_property tesvar_battery_props[] = {
 	POWER_SUPPLY_PROP_STATUS,
 	POWER_SUPPLY_PROP_HEALTH,
@@ -142,7 +202,8 @@ static int tesvar_battery_get_property(struct power_supply *psy,
 {
 	switch (psp) {
 	case POWER_SUPPLY_PROP_STATUS:
-		val->intval = POWER_SUPPLY_STATUS_DISCHARGING;
+		val->intval = tesvar_ac_online() ? POWER_SUPPLY_STATUS_CHARGING :
+			      POWER_SUPPLY_STATUS_DISCHARGING;
 		break;
 	case POWER_SUPPLY_PROP_HEALTH:
 		val->intval = POWER_SUPPLY_HEALTH_GOOD;
@@ -166,7 +227,7 @@ static int tesvar_battery_get_property(struct power_supply *psy,
 		val->intval = 3871000;
 		break;
 	case POWER_SUPPLY_PROP_CURRENT_NOW:
-		val->intval = -412000;
+		val->intval = tesvar_ac_online() ? 1250000 : -412000;
 		break;
 	case POWER_SUPPLY_PROP_CHARGE_FULL_DESIGN:
 		val->intval = 3110000;
@@ -237,17 +298,31 @@ static const struct power_supply_desc tesvar_battery_desc = {
 	.get_property = tesvar_battery_get_property,
 };
 
+static char *tesvar_ac_supplied_to[] = {
+	TESVAR_BATTERY_SUPPLY,
+};
+
+static const struct power_supply_desc tesvar_ac_desc = {
+	.name = TESVAR_AC_SUPPLY,
+	.type = POWER_SUPPLY_TYPE_MAINS,
+	.properties = tesvar_ac_props,
+	.num_properties = ARRAY_SIZE(tesvar_ac_props),
+	.get_property = tesvar_ac_get_property,
+};
+
 static void tesvar_battery_forget(void *data)
 {
 	spin_lock(&tesvar_battery_lock);
 	tesvar_battery = NULL;
+	tesvar_ac = NULL;
 	spin_unlock(&tesvar_battery_lock);
 }
 
 static int tesvar_battery_probe(struct platform_device *pdev)
 {
 	struct power_supply_config cfg = {};
-	struct power_supply *psy;
+	struct power_supply_config ac_cfg = {};
+	struct power_supply *psy, *ac;
 
 	cfg.attr_grp = tesvar_battery_groups;
 	psy = devm_power_supply_register(&pdev->dev, &tesvar_battery_desc,
@@ -257,10 +332,18 @@ static int tesvar_battery_probe(struct platform_device *pdev)
 				     "cannot register %s\n",
 				     TESVAR_BATTERY_SUPPLY);
 
+	ac_cfg.supplied_to = tesvar_ac_supplied_to;
+	ac_cfg.num_supplicants = ARRAY_SIZE(tesvar_ac_supplied_to);
+	ac = devm_power_supply_register(&pdev->dev, &tesvar_ac_desc, &ac_cfg);
+	if (IS_ERR(ac))
+		return dev_err_probe(&pdev->dev, PTR_ERR(ac),
+				     "cannot register %s\n", TESVAR_AC_SUPPLY);
+
 	spin_lock(&tesvar_battery_lock);
 	tesvar_battery = psy;
+	tesvar_ac = ac;
 	spin_unlock(&tesvar_battery_lock);
-	/* Released first: no change is announced to a battery being removed. */
+	/* Released first: no change is announced to a supply being removed. */
 	return devm_add_action_or_reset(&pdev->dev, tesvar_battery_forget, NULL);
 }
 

@@ -5,8 +5,9 @@
 //
 // A service of class C is the first device whose KOLVRAND_SERVICE property
 // (a udev rule's, or the driver's uevent variable) is C; failing that, the
-// first device of the class's subsystem whose parent is bound to a driver
-// named C, which is how the reference drivers are found with no udev at all.
+// first device of the class's subsystem and kind whose parent is bound to a
+// driver named C, which is how the reference drivers are found with no udev
+// at all.
 #include <fcntl.h>
 #include <linux/tesvar_kvr.h>
 #include <sys/ioctl.h>
@@ -37,10 +38,18 @@ static_assert(kBatteryParamsSize == TESVAR_KVR_BATTERY_PARAMS_SIZE);
 
 constexpr const char* kServiceProperty = "KOLVRAND_SERVICE";
 
-// Where each class's devices live when no udev property names them.
-constexpr std::pair<std::string_view, const char*> kClassSubsystems[] = {
-    {"TesvarSmartBattery", "power_supply"},
-    {kServiceClass, "misc"},
+// Where each class's devices live when no udev property names them, and
+// the attribute that tells them from the driver's other devices there (a
+// battery driver often registers the mains supply that charges it too).
+struct ClassDevices {
+  std::string_view className;
+  const char* subsystem;
+  const char* attribute;  // nullptr: any device of the subsystem
+  const char* value;
+};
+constexpr ClassDevices kClassDevices[] = {
+    {"TesvarSmartBattery", "power_supply", "type", "Battery"},
+    {kServiceClass, "misc", nullptr, nullptr},
 };
 
 struct DeviceUnref {
@@ -85,12 +94,14 @@ std::optional<std::string> findByProperty(std::string_view className) {
 }
 
 std::optional<std::string> findByDriver(std::string_view className) {
-  const char* subsystem = nullptr;
-  for (const auto& [name, sub] : kClassSubsystems)
-    if (name == className) subsystem = sub;
-  if (!subsystem) return std::nullopt;
+  const ClassDevices* devices = nullptr;
+  for (const ClassDevices& d : kClassDevices)
+    if (d.className == className) devices = &d;
+  if (!devices) return std::nullopt;
   EnumeratorPtr e = enumerator();
-  if (!e || sd_device_enumerator_add_match_subsystem(e.get(), subsystem, 1) < 0)
+  if (!e || sd_device_enumerator_add_match_subsystem(e.get(), devices->subsystem, 1) < 0 ||
+      (devices->attribute &&
+       sd_device_enumerator_add_match_sysattr(e.get(), devices->attribute, devices->value, 1) < 0))
     return std::nullopt;
   for (sd_device* d = sd_device_enumerator_get_device_first(e.get()); d;
        d = sd_device_enumerator_get_device_next(e.get())) {

@@ -95,6 +95,16 @@ class Testbed {
     return path;
   }
 
+  // A device beside `device`, below the same parent, in `subsystem`.
+  std::string addBeside(const std::string& device, const char* subsystem, const char* name) {
+    const std::string parent = fs::path(device).parent_path().string();
+    gchar* dev =
+        umockdev_testbed_add_device(bed_, subsystem, name, parent.c_str(), nullptr, nullptr);
+    std::string path = dev;
+    g_free(dev);
+    return path;
+  }
+
   void attribute(const std::string& device, const char* name, const std::string& value) {
     fs::path file = root_ / fs::path(device).relative_path() / name;
     fs::create_directories(file.parent_path());
@@ -436,6 +446,10 @@ TEST(HostRegistry, DriversThroughSysfsAndTheNode) {
     if (c.batteryDriver) {
       const std::string battery = bed.add(c.batteryDriver, "power_supply", "BAT0",
                                           c.batteryByProperty ? "TesvarSmartBattery" : nullptr);
+      bed.attribute(battery, "type", "Battery\n");
+      // The mains supply the driver registers too comes first in sysfs order
+      // and is no battery.
+      bed.attribute(bed.addBeside(battery, "power_supply", "AC"), "type", "Mains\n");
       if (c.chemID) bed.attribute(battery, "algo_chem_id", c.chemID);
       if (c.serial) bed.attribute(battery, "serial_number", c.serial);
     }
