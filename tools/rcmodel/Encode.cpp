@@ -57,8 +57,8 @@ int run(const Arguments& a) {
   size_t used = 0;
   JSONError why;
   const bool ok = forEachModelInJSON(
-      std::string_view(reinterpret_cast<const char*>(text->data()), text->size()), a.raw,
-      {kLimit, &used}, &why, [&](std::shared_ptr<OTAParamRC> model, JSONError* refused) {
+      *text, a.raw, {kLimit, &used}, &why,
+      [&](std::shared_ptr<OTAParamRC> model, JSONError* refused) {
         const size_t size = model->encodedSize();
         const size_t framed = a.raw ? size : wire::varintSize(size) + size;
         if (framed > kLimit - used) {

@@ -76,7 +76,10 @@ fs::path finalTarget(fs::path path, int* err, int* fd) {
 int replaceFile(const fs::path& target, std::string_view bytes, std::string* step) {
   fs::path dir = target.parent_path();
   if (dir.empty()) dir = ".";
-  std::string temporary = (dir / ("." + target.filename().string() + ".XXXXXX")).string();
+  std::string name = ".";
+  name += target.filename().string();
+  name += ".XXXXXX";
+  std::string temporary = (dir / name).string();
   const int fd = ::mkstemp(temporary.data());
   if (fd < 0) {
     *step = "cannot create a file in " + dir.string() + " to replace it with";

@@ -35,9 +35,9 @@ class StderrSink : public LogSink {
   std::string prefix_;
 };
 
-std::optional<std::vector<uint8_t>> readStdin(const std::string& command, size_t limit,
-                                              const char* kind) {
-  std::vector<uint8_t> bytes;
+template <typename Bytes>
+std::optional<Bytes> readStdin(const std::string& command, size_t limit, const char* kind) {
+  Bytes bytes;
   uint8_t buffer[65536];
   for (;;) {
     ssize_t n = ::read(STDIN_FILENO, buffer, sizeof buffer);
@@ -53,18 +53,6 @@ std::optional<std::vector<uint8_t>> readStdin(const std::string& command, size_t
                          "-byte limit for " + kind);
       return std::nullopt;
     }
-  }
-}
-
-// The stream reader's buffer type is its own business (a vector, or a buffer
-// with bytes()); a model is small enough to copy.
-template <typename Contents>
-std::vector<uint8_t> copyBytes(const Contents& contents) {
-  if constexpr (requires { contents.bytes(); }) {
-    const auto bytes = contents.bytes();
-    return std::vector<uint8_t>(bytes.begin(), bytes.end());
-  } else {
-    return std::vector<uint8_t>(contents.begin(), contents.end());
   }
 }
 
@@ -118,8 +106,8 @@ int usageError(const std::string& command, const std::string& message) {
   return kExitUsage;
 }
 
-std::optional<std::vector<uint8_t>> readInput(const std::string& command, const std::string& path) {
-  if (path == "-") return readStdin(command, kMaxJSONSize, "JSON");
+std::optional<std::string> readInput(const std::string& command, const std::string& path) {
+  if (path == "-") return readStdin<std::string>(command, kMaxJSONSize, "JSON");
   std::string why;
   int err = 0;
   auto text = readSmallFile(path, kMaxJSONSize, &why, &err);
@@ -132,19 +120,20 @@ std::optional<std::vector<uint8_t>> readInput(const std::string& command, const 
                                         : "; check the file's path"));
     return std::nullopt;
   }
-  return std::vector<uint8_t>(text->begin(), text->end());
+  return text;
 }
 
 std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
                                                    const std::string& path) {
-  if (path == "-") return readStdin(command, PBStreamReader::kMaxFileSize, "a model file");
+  if (path == "-")
+    return readStdin<std::vector<uint8_t>>(command, PBStreamReader::kMaxFileSize, "a model file");
   NSError why;
   auto file = PBStreamReader::readFile(path, &why);
   if (!file) {
     error(command, why.localizedDescription + "; give the path of a model file");
     return std::nullopt;
   }
-  return copyBytes(*file);
+  return file;
 }
 
 void routeLogToStderr(const std::string& command) {

@@ -75,7 +75,7 @@ inline constexpr size_t kMaxJSONSize = 64 * 1024 * 1024;
 // A file is read as every file is: a regular file (a FIFO is refused without
 // waiting for a writer), at most kMaxJSONSize bytes. Model files are read by
 // the daemon's stream reader, with its checks and its error descriptions.
-std::optional<std::vector<uint8_t>> readInput(const std::string& command, const std::string& path);
+std::optional<std::string> readInput(const std::string& command, const std::string& path);
 std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
                                                    const std::string& path);
 // Writes `bytes` to standard output for "-", else to PATH: a regular file (or

@@ -148,6 +148,10 @@ class Walker {
     if (length > 5)
       note(at, "a tag of " + std::to_string(length) +
                    " bytes: the standard parser reads tags of at most 5 and rejects the file");
+    else if (*tag > 0xffffffff)
+      note(at, "a tag wider than 32 bits: the standard parser drops its top bits and reads field " +
+                   std::to_string((*tag & 0xffffffff) >> 3) + ", the daemon field " +
+                   std::to_string(static_cast<uint32_t>(*tag >> 3)));
     if ((*tag >> 3 & 0xffffffff) == 0 && (*tag & 7) != 4)
       note(at, "field number 0: the standard parser rejects the file; the daemon skips the field");
     return true;
