@@ -1,5 +1,7 @@
 #include "tools/rcmodel/WireCheck.h"
 
+#include <utility>
+
 #include "model/FieldTable.h"
 #include "model/OTAParamRC.h"
 
@@ -50,7 +52,7 @@ class Walker {
     while (pos < end) {
       const size_t at = pos;
       uint64_t tag = 0;
-      if (!tagAt(&pos, end, &tag)) return end;
+      if (!tagAt(&pos, end, &tag) || stopped()) return end;
       const auto type = static_cast<uint8_t>(tag & 7);
       const auto number = static_cast<uint32_t>(tag >> 3);
       if (type == 4) {
@@ -63,7 +65,7 @@ class Walker {
       }
       const FieldDescriptor* d = table.find(number);
       if (!d) {
-        if (!skip(number, type, at, &pos, end)) return end;
+        if (!skip(number, type, at, &pos, end) || stopped()) return end;
         continue;
       }
       const bool fits = type == detail::writtenWireType(d->kind) ||
@@ -74,11 +76,11 @@ class Walker {
                      "reads " +
                      kindName(d->kind));
       else if (!fits)
-        note(at, fieldName(*d) + " as " + wireTypeName(type) + ", where the schema has " +
-                     wireTypeName(detail::writtenWireType(d->kind)) +
-                     ": the standard parser keeps it as an unknown field and reads on from "
-                     "there; the daemon reads " +
-                     kindName(d->kind));
+        diverge(at, fieldName(*d) + " as " + wireTypeName(type) + ", where the schema has " +
+                        wireTypeName(detail::writtenWireType(d->kind)) +
+                        ": the standard parser keeps it as an unknown field, the daemon reads " +
+                        kindName(d->kind));
+      if (stopped()) return end;
       switch (d->kind) {
         case FieldKind::SubMessage: {
           if (number < 64 && (subsSeen >> number & 1))
@@ -120,6 +122,16 @@ class Walker {
  private:
   void note(size_t at, std::string text) { problems_->add(base_ + at, std::move(text)); }
 
+  // A place from which the two parsers read different things: what follows
+  // in the same message is not judged, since the standard parser does not
+  // see it as the daemon does. The enclosing message goes on after it, as
+  // both parsers do.
+  void diverge(size_t at, const std::string& text) {
+    note(at, text + "; the rest of this message is read otherwise and not checked");
+    diverged_ = true;
+  }
+  bool stopped() { return std::exchange(diverged_, false); }
+
   // A varint of at most ten bytes; false when cut short.
   bool varint(size_t* pos, size_t end, uint64_t* value, size_t* length = nullptr) {
     const size_t at = *pos;
@@ -149,9 +161,10 @@ class Walker {
       note(at, "a tag of " + std::to_string(length) +
                    " bytes: the standard parser reads tags of at most 5 and rejects the file");
     else if (*tag > 0xffffffff)
-      note(at, "a tag wider than 32 bits: the standard parser drops its top bits and reads field " +
-                   std::to_string((*tag & 0xffffffff) >> 3) + ", the daemon field " +
-                   std::to_string(static_cast<uint32_t>(*tag >> 3)));
+      diverge(at,
+              "a tag wider than 32 bits: the standard parser drops its top bits and reads field " +
+                  std::to_string((*tag & 0xffffffff) >> 3) + ", the daemon field " +
+                  std::to_string(static_cast<uint32_t>(*tag >> 3)));
     if ((*tag >> 3 & 0xffffffff) == 0 && (*tag & 7) != 4)
       note(at, "field number 0: the standard parser rejects the file; the daemon skips the field");
     return true;
@@ -194,6 +207,7 @@ class Walker {
       at = *pos;
       uint64_t tag = 0;
       if (!tagAt(pos, end, &tag)) return false;
+      if (diverged_) return true;
       number = static_cast<uint32_t>(tag >> 3);
       type = static_cast<uint8_t>(tag & 7);
     }
@@ -202,6 +216,7 @@ class Walker {
   std::span<const uint8_t> bytes_;
   size_t base_;
   WireProblems* problems_;
+  bool diverged_ = false;
 };
 
 }  // namespace
