@@ -223,7 +223,9 @@ TEST_P(HostileInput, IsRefusedOrBoundedAsItsRowSays) {
       daemon.signal(SIGTERM);
       EXPECT_EQ(daemon.waitForExit(std::chrono::seconds(30)), 0) << daemon.rawStderr();
       EXPECT_LT(Clock::now() - start, std::chrono::seconds(15));
-      lines = daemon.lines();
+      bool wellFormed = false;
+      lines = daemon.lines(&wellFormed);
+      EXPECT_TRUE(wellFormed) << daemon.rawStderr();
     } else {
       lines = runDaemon(device, outcome == "uploaded" ? Outcome::Uploaded
                                 : outcome == "failed" ? Outcome::Failed
