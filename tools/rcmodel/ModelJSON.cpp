@@ -462,15 +462,15 @@ bool forEachModelInJSON(std::string_view text, bool single, const ModelBudget& b
       const size_t count = static_cast<size_t>(std::count_if(text.begin(), text.end(),
                                                              [](char c) { return c == '\n'; })) +
                            1;
-      size_t models = 0;
+      size_t lineModels = 0;
       if (count > budget.limit / 4) {
         Lines all(text);
         std::string_view line;
         size_t number = 0;
-        while (all.next(&line, &number)) ++models;
+        while (all.next(&line, &number)) ++lineModels;
       }
-      if (models > (budget.limit - std::min(budget.limit, *budget.used)) / 4)
-        return fail("$", "holds " + std::to_string(models) +
+      if (lineModels > (budget.limit - std::min(budget.limit, *budget.used)) / 4)
+        return fail("$", "holds " + std::to_string(lineModels) +
                              " models, one a line, of at least 4 bytes each once encoded: more "
                              "than the " +
                              std::to_string(budget.limit) +
