@@ -6,7 +6,8 @@
 //     "status", patterns its standard output ("stdout") and error ("stderr")
 //     must match (an error without a pattern must be empty, "not" one that
 //     neither may), and "most": the memory (MiB of peak resident set) and time
-//     (seconds) it may take, as kolvrand-measure finds them; or
+//     (seconds) it may take, as kolvrand-measure finds them; "xml": a file it
+//     writes that must hold only characters XML allows; or
 //   "daemon": a run of the daemon there, and how it ends ("uploaded", "failed",
 //     "no boot session", or "stopped" by SIGTERM while its work is stuck), with
 //     part of a "line" it logs ("@" stands for the model file's path) and the
@@ -198,6 +199,13 @@ TEST_P(HostileInput, IsRefusedOrBoundedAsItsRowSays) {
     EXPECT_TRUE(row.contains("stderr") ? found(err, row["stderr"]) : err.empty()) << err;
     EXPECT_TRUE(!row.contains("stdout") || found(out, row["stdout"])) << out.substr(0, 2000);
     EXPECT_TRUE(!row.contains("not") || !found(out + err, row["not"])) << out.substr(0, 2000);
+    if (row.contains("xml")) {
+      const std::string xml = readFile(device.path(row["xml"].get<std::string>()));
+      EXPECT_TRUE(isValidUTF8(xml));
+      // No control character but tab and line ends, nor U+FFFE or U+FFFF.
+      EXPECT_FALSE(found(xml, "[\x01-\x08\x0b\x0c\x0e-\x1f]|\xef\xbf[\xbe\xbf]"));
+      EXPECT_EQ(xml.find('\0'), std::string::npos);
+    }
     double kib = 0, seconds = 0;
     std::istringstream(readFile(report)) >> kib >> seconds;
     std::cout << "peak " << kib / 1024 << " MiB, " << seconds << " s\n";
