@@ -3,18 +3,47 @@
 // fields dropped, each field once), written both unpacked and packed; our
 // reader must decode both to exactly the values libprotobuf holds, and our
 // writer must reproduce libprotobuf's bytes (so libprotobuf reads ours back).
+// And rcmodel validate's wire check: an input our reader decodes that
+// libprotobuf rejects, or reads to other values, the check must name.
 #include "fuzz/Support.h"
 #include "model/OTAParamRC.h"
 #include "oracle_packed.pb.h"
 #include "oracle_plain.pb.h"
 #include "tests/support/OracleDictionary.h"
+#include "tools/rcmodel/WireCheck.h"
 
 using namespace kolvrand;
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   kolvrand::oracle::OTAParamRC plain;
   kolvrand::oracle_packed::OTAParamRC packed;
-  if (!plain.ParseFromArray(data, static_cast<int>(size))) return 0;
+  const bool parsed = plain.ParseFromArray(data, static_cast<int>(size));
+  OTAParamRC raw;
+  PBDataReader rawReader(data, size);
+  if (raw.readFrom(rawReader)) {
+    rcmodel::WireProblems problems;
+    rcmodel::checkWire({data, size}, 0, &problems);
+    // What the check says libprotobuf rejects, it does.
+    for (const auto& p : problems.shown)
+      fuzz::check(!parsed || p.text.find("rejects the file") == std::string::npos);
+    if (problems.count == 0) {
+      // Read alike, but for an MLBConfig the enum does not name: our reader
+      // carries it, libprotobuf keeps it apart as an unknown field (and
+      // shows an earlier named value, if any).
+      fuzz::check(parsed);
+      const Value read = raw.dictionaryRepresentation();
+      const Value* named = read.asDictionary()->find("MLBConfig");
+      const bool unnamed = named && named->asString()->starts_with("(unknown");
+      const auto compared = [&](const Value& v) {
+        Dictionary d;
+        for (const auto& [key, value] : *v.asDictionary())
+          if (key != "MLBConfig" || !unnamed) d.set(key, value);
+        return Value(d);
+      };
+      fuzz::check(compared(read) == compared(test::oracleDictionary(plain)));
+    }
+  }
+  if (!parsed) return 0;
   plain.DiscardUnknownFields();
   // Our writer always writes chemID; with it set, the bytes can match.
   if (!plain.has_chemid()) plain.set_chemid(0);

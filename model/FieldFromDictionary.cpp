@@ -1,9 +1,11 @@
 // Taking a message's dictionary form back into the message: the reverse of
 // dictionaryOfFields, driven by the same table of keys and kinds, so that the
 // tools that read models written by hand never keep a field list of their own.
+#include <algorithm>
 #include <charconv>
 #include <cmath>
 #include <cstdint>
+#include <cstdio>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -16,7 +18,7 @@ namespace kolvrand::detail {
 namespace {
 
 bool fail(DictionaryError* error, std::string path, std::string reason) {
-  if (error) *error = {std::move(path), std::move(reason)};
+  if (error) *error = {std::move(path), std::move(reason), {}};
   return false;
 }
 
@@ -53,28 +55,50 @@ std::string describe(const Value& value) {
 // infinity; converting them is not even defined behaviour.
 constexpr double kFloatOverflow = 0x1.ffffffp127;
 
-bool floatFromValue(const Value& value, float* out, std::string* reason) {
+// `reason` naming the number `n` as its description reads.
+bool numberReason(const Number& n, std::string text, std::string* reason, std::string* number) {
+  *reason = std::move(text);
+  *number = n.description();
+  return false;
+}
+
+bool floatFromValue(const Value& value, float* out, std::string* reason, std::string* number) {
   const Number* n = value.asNumber();
   if (!n) {
     *reason = "expected a float, got " + describe(value);
     return false;
   }
-  if (n->kind() == Number::Kind::Float) {
-    *out = n->floatValue();
-    return true;
+  switch (n->kind()) {
+    case Number::Kind::Float:
+      *out = n->floatValue();
+      return true;
+    // An integer is rounded to a float once, from its exact value (through a
+    // double, one above 2^53 would be rounded twice).
+    case Number::Kind::Signed:
+      *out = static_cast<float>(n->int64Value());
+      return true;
+    case Number::Kind::Unsigned:
+      *out = static_cast<float>(n->uint64Value());
+      return true;
+    case Number::Kind::Double:
+      break;
   }
   const double d = n->doubleValue();
-  if (std::isfinite(d) && std::fabs(d) >= kFloatOverflow) {
-    *reason = n->description() + " is out of range for a 32-bit float";
-    return false;
-  }
+  if (std::isfinite(d) && std::fabs(d) >= kFloatOverflow)
+    return numberReason(*n, n->description() + " is out of range for a 32-bit float", reason,
+                        number);
   *out = static_cast<float>(d);
   return true;
 }
 
-// The integral value of `value` within [min, max] (both exact as doubles).
+// The value of `value` within [min, max], exactly. Integers are what the
+// number says they are: a Signed or Unsigned number. A Float or Double is
+// what is left of a number that is no integer, or that lies beyond 64 bits,
+// or of negative zero (the JSON layer turns every other integer, whatever its
+// spelling, into one of the two integer kinds); so its rounded value never
+// makes a fraction look like an integer, or one in range look out of it.
 bool integerFromValue(const Value& value, int64_t min, int64_t max, const char* what, int64_t* out,
-                      std::string* reason) {
+                      std::string* reason, std::string* number) {
   const Number* n = value.asNumber();
   bool inRange = false;
   if (n && n->kind() == Number::Kind::Signed) {
@@ -83,28 +107,29 @@ bool integerFromValue(const Value& value, int64_t min, int64_t max, const char* 
   } else if (n && n->kind() == Number::Kind::Unsigned) {
     inRange = n->uint64Value() <= static_cast<uint64_t>(max);
     if (inRange) *out = static_cast<int64_t>(n->uint64Value());
-  } else if (n && std::isfinite(n->doubleValue()) &&
-             std::trunc(n->doubleValue()) == n->doubleValue()) {
-    const double d = n->doubleValue();
-    inRange = d >= static_cast<double>(min) && d <= static_cast<double>(max);
-    if (inRange) *out = static_cast<int64_t>(d);
+  } else if (n && n->doubleValue() == 0) {
+    inRange = true;
+    *out = 0;
+  } else if (n && std::isfinite(n->doubleValue()) && std::fabs(n->doubleValue()) >= 0x1p63) {
+    inRange = false;
   } else {
     *reason = std::string("expected ") + what + ", got " + describe(value);
+    if (n) *number = n->description();
     return false;
   }
-  if (!inRange) {
-    *reason = n->description() + " is out of range for " + what + " (" + std::to_string(min) +
-              " to " + std::to_string(max) + ")";
-    return false;
-  }
+  if (!inRange)
+    return numberReason(*n,
+                        n->description() + " is out of range for " + what + " (" +
+                            std::to_string(min) + " to " + std::to_string(max) + ")",
+                        reason, number);
   return true;
 }
 
 // An enum from one of its dictionary strings (a value's name or "(unknown: N)"
 // for a value without one) or from its number. Only the string the dictionary
 // would show for a value is taken, so what is read prints back the same.
-bool enumFromValue(const FieldDescriptor& d, const Value& value, int32_t* out,
-                   std::string* reason) {
+bool enumFromValue(const FieldDescriptor& d, const Value& value, int32_t* out, std::string* reason,
+                   std::string* numberShown) {
   const std::string* s = value.asString();
   if (s) {
     int32_t candidate = d.enumValue(std::string_view(*s));
@@ -127,7 +152,8 @@ bool enumFromValue(const FieldDescriptor& d, const Value& value, int32_t* out,
     return false;
   }
   int64_t number = 0;
-  if (!integerFromValue(value, INT32_MIN, INT32_MAX, "a 32-bit integer", &number, reason))
+  if (!integerFromValue(value, INT32_MIN, INT32_MAX, "a 32-bit integer", &number, reason,
+                        numberShown))
     return false;
   *out = static_cast<int32_t>(number);
   return true;
@@ -154,51 +180,58 @@ const FieldDescriptor* nearKey(const MessageTable& table, std::string_view key) 
 
 bool setField(const FieldDescriptor& d, MutableFields fields, const Value& value,
               DictionaryError* error) {
-  std::string reason;
+  std::string reason, number;
+  const auto fail = [&](std::string path, std::string why) {
+    if (error) *error = {std::move(path), std::move(why), std::move(number)};
+    return false;
+  };
   switch (d.kind) {
     case FieldKind::SubMessage: {
       std::shared_ptr<PBCodable> message = d.makeMessage();
       if (!value.isDictionary())
-        return fail(error, d.key,
-                    std::string("expected an object (") + message->className() + "), got " +
-                        describe(value));
+        return fail(d.key, std::string("expected an object (") + message->className() + "), got " +
+                               describe(value));
       DictionaryError inner;
-      if (!message->setFieldsFromDictionary(value, &inner))
-        return fail(error, joinPath(d.key, inner.path), std::move(inner.reason));
+      if (!message->setFieldsFromDictionary(value, &inner)) {
+        number = std::move(inner.number);
+        return fail(joinPath(d.key, inner.path), std::move(inner.reason));
+      }
       fields.subs[d.slot] = std::move(message);
       return true;
     }
     case FieldKind::RepeatedFloat: {
       const Array* array = value.asArray();
-      if (!array) return fail(error, d.key, "expected an array of floats, got " + describe(value));
+      if (!array) return fail(d.key, "expected an array of floats, got " + describe(value));
       std::vector<float> floats(array->size());
       for (size_t i = 0; i < array->size(); ++i)
-        if (!floatFromValue((*array)[i], &floats[i], &reason))
-          return fail(error, element(d.key, i), std::move(reason));
+        if (!floatFromValue((*array)[i], &floats[i], &reason, &number))
+          return fail(element(d.key, i), std::move(reason));
       PBRepeatedFloatSet(fields.lists[d.slot], floats.data(), floats.size());
       return true;
     }
     case FieldKind::Uint32: {
-      int64_t number = 0;
-      if (!integerFromValue(value, 0, UINT32_MAX, "an unsigned 32-bit integer", &number, &reason))
-        return fail(error, d.key, std::move(reason));
-      fields.ints[d.slot] = static_cast<uint32_t>(number);
+      int64_t integer = 0;
+      if (!integerFromValue(value, 0, UINT32_MAX, "an unsigned 32-bit integer", &integer, &reason,
+                            &number))
+        return fail(d.key, std::move(reason));
+      fields.ints[d.slot] = static_cast<uint32_t>(integer);
       return true;
     }
     case FieldKind::OptionalFloat:
-      if (!floatFromValue(value, &fields.floats[d.slot], &reason))
-        return fail(error, d.key, std::move(reason));
+      if (!floatFromValue(value, &fields.floats[d.slot], &reason, &number))
+        return fail(d.key, std::move(reason));
       *fields.has |= d.hasMask();
       return true;
     case FieldKind::OptionalEnum: {
-      int32_t number = 0;
-      if (!enumFromValue(d, value, &number, &reason)) return fail(error, d.key, std::move(reason));
-      fields.ints[d.slot] = static_cast<uint32_t>(number);
+      int32_t enumValue = 0;
+      if (!enumFromValue(d, value, &enumValue, &reason, &number))
+        return fail(d.key, std::move(reason));
+      fields.ints[d.slot] = static_cast<uint32_t>(enumValue);
       *fields.has |= d.hasMask();
       return true;
     }
   }
-  return fail(error, d.key, "unsupported field kind");
+  return fail(d.key, "unsupported field kind");
 }
 
 }  // namespace
@@ -211,7 +244,7 @@ bool setFieldsFromDictionary(const MessageTable& table, MutableFields fields,
     const FieldDescriptor* d = findKey(table, key);
     if (!d) {
       const FieldDescriptor* near = nearKey(table, key);
-      return fail(error, key,
+      return fail(error, dictionaryPathKey(key),
                   near ? std::string("unknown key; did you mean \"") + near->key + "\"?"
                        : std::string("unknown key"));
     }
@@ -221,3 +254,30 @@ bool setFieldsFromDictionary(const MessageTable& table, MutableFields fields,
 }
 
 }  // namespace kolvrand::detail
+
+namespace kolvrand {
+
+std::string dictionaryPathKey(const std::string& key) {
+  const bool name = !key.empty() && std::all_of(key.begin(), key.end(), [](char c) {
+    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_';
+  });
+  if (name) return key;
+  std::string out = "[\"";
+  for (unsigned char c : key) {
+    if (c == '"' || c == '\\') {
+      out += '\\';
+      out += static_cast<char>(c);
+    } else if (c == '\n' || c == '\t') {
+      out += c == '\n' ? "\\n" : "\\t";
+    } else if (c < 0x20 || c == 0x7f) {
+      char escape[8];
+      std::snprintf(escape, sizeof escape, "\\u%04x", c);
+      out += escape;
+    } else {
+      out += static_cast<char>(c);
+    }
+  }
+  return out + "\"]";
+}
+
+}  // namespace kolvrand

@@ -19,6 +19,7 @@ class GeneratedMessage : public PBCodable {
   using Slots = SlotsT;
 
   const char* className() const override { return Derived::kClassName; }
+  const MessageTable& fieldTable() const override { return Derived::table(); }
 
   bool readFrom(PBDataReader& reader) override {
     return readFields(Derived::table(), fields_.view(), reader);

@@ -14,13 +14,25 @@
 
 namespace kolvrand {
 
+namespace detail {
+struct MessageTable;
+}
+
 // Why a dictionary could not be taken into a message, and where: `path` is the
 // keys from the message down, joined by '.', with list positions as "[i]"
 // ("R0.resistance25C[3]"); empty for the dictionary itself.
 struct DictionaryError {
   std::string path;
   std::string reason;
+  // The number the reason names, as its description reads ("4294967296"),
+  // so that a caller holding the text it came from can show it as written.
+  std::string number;
 };
+
+// A key as DictionaryError paths show it: as it is when it is a name, else in
+// brackets as a JSON string (["a.b"], ["\u0000"]), so that no key reads as
+// two and none cuts a message short.
+std::string dictionaryPathKey(const std::string& key);
 
 class PBCodable {
  public:
@@ -32,6 +44,8 @@ class PBCodable {
   PBCodable& operator=(const PBCodable&) = delete;
 
   virtual const char* className() const = 0;
+  // The rows of the message's fields, for tools that walk its encoding.
+  virtual const detail::MessageTable& fieldTable() const = 0;
 
   // Decodes fields from the reader's position up to its limit into this
   // message; true when the reader's error flag is clear at the end.

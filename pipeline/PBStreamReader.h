@@ -76,31 +76,54 @@ class PBStreamReader {
     return messages;
   }
 
- private:
-  // Decodes the messages of `bytes` in order, handing each to `take`.
-  template <typename Message, typename Take>
-  static bool readEach(std::span<const uint8_t> bytes, NSError* error, Take&& take) {
+  // Where one message of a file lies: its position in the file, the offset
+  // of its length and its bytes after the length.
+  struct Frame {
+    size_t index;
+    size_t offset;
+    std::span<const uint8_t> body;
+  };
+
+  // The frames of `bytes` in order, without decoding them: each is handed to
+  // `take(frame)`, which returns false to stop early. false with *error when
+  // a length is cut short or reaches past the end.
+  template <typename Take>
+  static bool forEachFrame(std::span<const uint8_t> bytes, NSError* error, Take&& take) {
     size_t offset = 0;
     for (size_t index = 0; offset < bytes.size(); ++index) {
       const size_t start = offset;
       std::span<const uint8_t> body;
       if (!nextFrame(bytes, &offset, &body, index, error)) return false;
-      auto message = std::make_shared<Message>();
-      PBDataReader reader(body.data(), body.size());
-      if (!message->readFrom(reader)) {
-        if (error) *error = messageError(index, start);
-        return false;
-      }
-      take(std::move(message));
+      if (!take(Frame{index, start, body})) return true;
     }
     return true;
+  }
+
+  // Why message `index`, whose length is at `offset`, fails.
+  static NSError messageError(size_t index, size_t offset);
+
+ private:
+  // Decodes the messages of `bytes` in order, handing each to `take`.
+  template <typename Message, typename Take>
+  static bool readEach(std::span<const uint8_t> bytes, NSError* error, Take&& take) {
+    bool decoded = true;
+    const bool framed = forEachFrame(bytes, error, [&](const Frame& frame) {
+      auto message = std::make_shared<Message>();
+      PBDataReader reader(frame.body.data(), frame.body.size());
+      if (!message->readFrom(reader)) {
+        if (error) *error = messageError(frame.index, frame.offset);
+        return decoded = false;
+      }
+      take(std::move(message));
+      return true;
+    });
+    return framed && decoded;
   }
 
   // Reads the length of message `index` at *offset and returns its body;
   // *offset moves past the body.
   static bool nextFrame(std::span<const uint8_t> bytes, size_t* offset,
                         std::span<const uint8_t>* body, size_t index, NSError* error);
-  static NSError messageError(size_t index, size_t offset);
 };
 
 }  // namespace kolvrand

@@ -12,6 +12,7 @@
 #include <mutex>
 
 #include "platform/Backend.h"
+#include "platform/FileManager.h"
 #include "platform/Internal.h"
 #include "platform/ValueJSON.h"
 
@@ -38,8 +39,11 @@ class FileLock {
  public:
   // Without `create`, a missing lock file is not made and nothing is locked.
   FileLock(const std::filesystem::path& path, int operation, bool create = true) {
-    fd_ = create ? ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600)
-                 : ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    // O_NONBLOCK: a FIFO put in the lock file's place must not hold the
+    // open until a writer comes.
+    constexpr int kFlags = O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
+    fd_ = create ? ::open(path.c_str(), O_RDWR | O_CREAT | kFlags, 0600)
+                 : ::open(path.c_str(), O_RDONLY | kFlags);
     if (fd_ < 0) {
       error_ = errno;
       return;
@@ -67,13 +71,16 @@ class FileLock {
 };
 
 // The suite's content; missing, unreadable or malformed files read as empty
-// (the latter two logged), and the next write replaces them.
+// (the latter two logged), and the next write replaces them. Something else
+// than a regular file in its place (a FIFO, a link to a device) or a file
+// beyond the size of any settings is unreadable: it never blocks the reader
+// or takes its memory.
 JSON readSuite(const std::filesystem::path& path) {
   int err = 0;
-  auto text = platform::readFile(path, &err);
+  std::string why;
+  auto text = readSmallFile(path.string(), platform::kMaxSmallFileSize, &why, &err);
   if (!text) {
-    if (err != ENOENT)
-      os_log_error(defaultsLog(), "cannot read %s: %s\n", path.string(), std::strerror(err));
+    if (err != ENOENT) os_log_error(defaultsLog(), "cannot read %s: %s\n", path.string(), why);
     return JSON::object();
   }
   JSON j = JSON::parse(*text, nullptr, false);
@@ -138,12 +145,14 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(
   return std::make_shared<NSUserDefaults>(std::move(shared));
 }
 
-std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(std::string_view suite) {
-  return openExistingSuiteNamed(suite, platform::backend().stateDirectory());
+std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(std::string_view suite,
+                                                                       std::string* why) {
+  return openExistingSuiteNamed(suite, platform::backend().stateDirectory(), why);
 }
 
 std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(
-    std::string_view suite, const std::filesystem::path& dir) {
+    std::string_view suite, const std::filesystem::path& dir, std::string* why) {
+  if (why) why->clear();
   if (!validSuiteName(suite)) return nullptr;
   std::error_code ec;
   std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
@@ -152,7 +161,15 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(
   shared->path = (absolute / (std::string(suite) + ".json")).lexically_normal();
   shared->lockPath = shared->path.string() + ".lock";
   shared->readOnly = true;
-  if (!std::filesystem::is_regular_file(shared->path, ec)) return nullptr;
+  // A suite that is not there is no error; one that may be there but cannot
+  // be read (a directory the caller may not search, a file it may not read)
+  // is, since its values are then unknown rather than absent.
+  int err = 0;
+  std::string reason;
+  if (!readSmallFile(shared->path.string(), platform::kMaxSmallFileSize, &reason, &err)) {
+    if (why && err != ENOENT) *why = shared->path.string() + ": " + reason;
+    return nullptr;
+  }
   return std::make_shared<NSUserDefaults>(std::move(shared));
 }
 

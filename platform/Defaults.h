@@ -24,12 +24,15 @@ class NSUserDefaults {
   static std::shared_ptr<NSUserDefaults> initWithSuiteName(std::string_view suite,
                                                            const std::filesystem::path& dir);
 
-  // An existing suite, for reading only: nil when its file does not exist or
-  // the name is no file name. Nothing is created, not even a lock file, and
-  // every set returns false.
-  static std::shared_ptr<NSUserDefaults> openExistingSuiteNamed(std::string_view suite);
+  // An existing suite, for reading only: nil when its file does not exist,
+  // cannot be read (then *why, when given, says "PATH: REASON"; it is empty
+  // for a suite that is not there) or the name is no file name. Nothing is
+  // created, not even a lock file, and every set returns false.
   static std::shared_ptr<NSUserDefaults> openExistingSuiteNamed(std::string_view suite,
-                                                                const std::filesystem::path& dir);
+                                                                std::string* why = nullptr);
+  static std::shared_ptr<NSUserDefaults> openExistingSuiteNamed(std::string_view suite,
+                                                                const std::filesystem::path& dir,
+                                                                std::string* why = nullptr);
 
   // An absent key, or a value of another type, reads as nil, 0 or false.
   std::optional<std::string> stringForKey(std::string_view key) const;

@@ -8,6 +8,7 @@
 #include <cstdlib>
 #include <deque>
 #include <exception>
+#include <future>
 #include <thread>
 #include <vector>
 
@@ -17,6 +18,11 @@
 namespace kolvrand {
 
 namespace {
+
+// How long dispatch_main waits for the work in progress once asked to stop:
+// far beyond any upload or aging run (milliseconds), well within the
+// service's stop timeout (30 s).
+constexpr std::chrono::seconds kStopGrace{5};
 
 // The signals that dispatch_main serves; every other thread keeps them blocked.
 sigset_t servedSignals() {
@@ -234,8 +240,26 @@ void dispatch_main() {
     break;
   }
   os_log_debug(platform::platformLog("dispatch"), "stopping on signal %d\n", signal);
-  stopAllQueues();
-  xpc_activity_stop();
+  // The queues are stopped on a thread of their own, so that a block waiting
+  // on something that never comes (a lock another process holds, a call that
+  // does not return) cannot keep the process beyond the grace: the service
+  // manager would kill it, with whatever half-done, once its stop timeout ran
+  // out. The new thread inherits the served signals blocked.
+  auto stopped = std::make_shared<std::promise<void>>();
+  std::future<void> done = stopped->get_future();
+  std::thread stopper([stopped] {
+    stopAllQueues();
+    xpc_activity_stop();
+    stopped->set_value();
+  });
+  if (done.wait_for(kStopGrace) != std::future_status::ready) {
+    os_log_error(platform::platformLog("dispatch"),
+                 "the work in progress did not finish within %lld s; stopping without it\n",
+                 static_cast<long long>(kStopGrace.count()));
+    std::fflush(nullptr);
+    std::_Exit(0);
+  }
+  stopper.join();
   std::fflush(nullptr);
   std::exit(0);
 }

@@ -58,7 +58,8 @@ void dispatch_once(dispatch_once_t* predicate, F&& block) {
 // The main thread waits for signals for the rest of the process's life:
 // SIGUSR1 runs every registered activity in its run state; SIGTERM and SIGINT
 // stop every queue once its block in progress has finished and end the
-// process with status 0.
+// process with status 0, without that block when it has not finished within
+// five seconds.
 [[noreturn]] void dispatch_main();
 
 }  // namespace kolvrand

@@ -78,4 +78,55 @@ std::optional<FileContents> NSFileManager::contentsOfRegularFile(const std::stri
   return file;
 }
 
+std::string_view fileKindName(unsigned mode) {
+  switch (mode & S_IFMT) {
+    case S_IFDIR:
+      return "a directory";
+    case S_IFIFO:
+      return "a FIFO";
+    case S_IFCHR:
+      return "a character device";
+    case S_IFBLK:
+      return "a block device";
+    case S_IFSOCK:
+      return "a socket";
+    case S_IFLNK:
+      return "a symbolic link";
+    default:
+      return "a regular file";
+  }
+}
+
+std::optional<std::string> readSmallFile(const std::string& path, size_t maxSize, std::string* why,
+                                         int* err) {
+  int fd = -1;
+  auto fail = [&](int code, std::string reason) -> std::optional<std::string> {
+    if (fd >= 0) ::close(fd);
+    if (why) *why = std::move(reason);
+    if (err) *err = code;
+    return std::nullopt;
+  };
+  fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+  if (fd < 0) return fail(errno, std::string("cannot open: ") + std::strerror(errno));
+  struct stat st {};
+  if (::fstat(fd, &st) != 0)
+    return fail(errno, std::string("cannot stat: ") + std::strerror(errno));
+  if (!S_ISREG(st.st_mode))
+    return fail(EINVAL, "not a regular file (" + std::string(fileKindName(st.st_mode)) + ")");
+  const std::string limit = "larger than the " + std::to_string(maxSize) + "-byte limit";
+  if (static_cast<uint64_t>(st.st_size) > maxSize) return fail(EFBIG, limit);
+  std::string out;
+  char buffer[8192];
+  for (;;) {
+    ssize_t n = ::read(fd, buffer, sizeof buffer);
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) return fail(errno, std::string("cannot read: ") + std::strerror(errno));
+    if (n == 0) break;
+    if (static_cast<size_t>(n) > maxSize - out.size()) return fail(EFBIG, limit);
+    out.append(buffer, static_cast<size_t>(n));
+  }
+  ::close(fd);
+  return out;
+}
+
 }  // namespace kolvrand

@@ -45,4 +45,19 @@ class NSFileManager {
                                                     std::string* error) const;
 };
 
+// What stands at a path that is not a regular file, for messages: "a
+// directory", "a FIFO", "a character device", "a block device", "a socket".
+std::string_view fileKindName(unsigned mode);
+
+// A small file whole (settings, a device description, JSON written by hand),
+// so that no file can block its reader or claim its memory: opened without
+// waiting (a FIFO is refused, never waited on), a regular file only (a link to
+// /dev/zero is a character device), and at most `maxSize` bytes, counted as
+// read since /proc and sysfs files claim a size of 0. nullopt on failure, with
+// *why the reason without the path ("not a regular file (a FIFO)", "larger
+// than the 1048576-byte limit", "cannot open: Permission denied") and *err an
+// errno value (EINVAL for what is not a regular file, EFBIG for too large).
+std::optional<std::string> readSmallFile(const std::string& path, size_t maxSize,
+                                         std::string* why = nullptr, int* err = nullptr);
+
 }  // namespace kolvrand

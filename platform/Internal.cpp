@@ -9,6 +9,8 @@
 #include <map>
 #include <mutex>
 
+#include "platform/FileManager.h"
+
 namespace kolvrand::platform {
 
 namespace {
@@ -49,26 +51,7 @@ const os_log_t& platformLog(std::string_view category) {
 }
 
 std::optional<std::string> readFile(const std::filesystem::path& path, int* err) {
-  int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
-  if (fd < 0) {
-    if (err) *err = errno;
-    return std::nullopt;
-  }
-  std::string out;
-  char buf[8192];
-  for (;;) {
-    ssize_t n = ::read(fd, buf, sizeof buf);
-    if (n < 0) {
-      if (errno == EINTR) continue;
-      if (err) *err = errno;
-      closeQuietly(fd);
-      return std::nullopt;
-    }
-    if (n == 0) break;
-    out.append(buf, static_cast<size_t>(n));
-  }
-  ::close(fd);
-  return out;
+  return readSmallFile(path.string(), kMaxSmallFileSize, nullptr, err);
 }
 
 bool writeFileAtomically(const std::filesystem::path& path, std::string_view bytes,

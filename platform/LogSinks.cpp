@@ -12,6 +12,8 @@
 #include <cstdlib>
 #include <mutex>
 
+#include "platform/Utf8.h"
+
 namespace kolvrand {
 
 namespace {
@@ -41,11 +43,10 @@ void writeStderrLine(LogLevel level, std::string_view category, std::string_view
   std::string line = "kolvrand[" + std::to_string(::getpid()) + "]: " + levelName(level) + " [";
   line.append(category);
   line += "] ";
-  size_t start = line.size();
-  line.append(withoutTrailingNewline(message));
-  // Keep one message on one line so that the output stays line-oriented.
-  for (size_t i = start; i < line.size(); ++i)
-    if (line[i] == '\n') line[i] = ' ';
+  // One message, one line, and nothing a terminal would act on: text from
+  // outside (a target type, a file name) may hold a line feed or an escape
+  // sequence, which show as escapes here. The journal keeps them as they are.
+  line += visibleText(withoutTrailingNewline(message));
   line += '\n';
   std::lock_guard lock(*mutex);
   const char* p = line.data();

@@ -14,6 +14,7 @@
 
 #include "platform/Backend.h"
 #include "platform/CommonCrypto.h"
+#include "platform/FileManager.h"
 #include "platform/IOKit.h"
 #include "platform/Internal.h"
 #include "platform/ValueJSON.h"
@@ -157,9 +158,11 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
   }
 
   bool load(std::string* error) {
-    int err = 0;
-    auto text = readFile(root_ / "device.json", &err);
-    if (!text) return fail(error, std::string("cannot read device.json: ") + std::strerror(err));
+    // Read like the settings: never waiting on a FIFO, never more than a
+    // device description can need.
+    std::string why;
+    auto text = readSmallFile((root_ / "device.json").string(), kMaxSmallFileSize, &why);
+    if (!text) return fail(error, "cannot read device.json: " + why);
     JSON doc = JSON::parse(*text, nullptr, false);
     if (doc.is_discarded()) return fail(error, "device.json is not valid JSON");
     if (!doc.is_object()) return fail(error, "device.json is not an object");

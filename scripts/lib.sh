@@ -7,7 +7,8 @@ KOLVRAND_ROOT=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
 
 # Debian packages the build and the tests need.
 KOLVRAND_PACKAGES=(cmake ninja-build g++ clang pkg-config libssl-dev nlohmann-json3-dev libumockdev-dev
-  libsystemd-dev libgtest-dev libgmock-dev protobuf-compiler libprotobuf-dev mandoc man-db)
+  libsystemd-dev libgtest-dev libgmock-dev protobuf-compiler libprotobuf-dev mandoc man-db
+  libxml2-utils)
 
 install_missing() {
   local missing=()

@@ -1,10 +1,13 @@
 // Random models against libprotobuf, built from the same schema: what it
 // encodes (unpacked or packed) we decode to the same values, and we encode
-// them to its very bytes (so it parses ours back to the same values).
+// them to its very bytes (so it parses ours back to the same values). And
+// rcmodel validate's wire check against libprotobuf: whatever our reader
+// decodes and libprotobuf rejects or reads otherwise, the check names.
 #include <google/protobuf/descriptor.h>
 #include <google/protobuf/message.h>
 #include <gtest/gtest.h>
 
+#include <fstream>
 #include <random>
 #include <string>
 #include <tuple>
@@ -14,6 +17,7 @@
 #include "oracle_plain.pb.h"
 #include "tests/model/Support.h"
 #include "tests/support/OracleDictionary.h"
+#include "tools/rcmodel/WireCheck.h"
 
 namespace kolvrand {
 namespace {
@@ -61,7 +65,11 @@ TEST(OTAParamRCOracle, AgreesWithLibprotobufOnRandomModels) {
     const std::string input = i % 2 ? packed.SerializeAsString() : plainBytes;
 
     OTAParamRC ours;
-    ASSERT_TRUE(test::decode(ours, std::vector<uint8_t>(input.begin(), input.end())));
+    const std::vector<uint8_t> bytes(input.begin(), input.end());
+    ASSERT_TRUE(test::decode(ours, bytes));
+    rcmodel::WireProblems problems;
+    rcmodel::checkWire(bytes, 0, &problems);
+    ASSERT_EQ(problems.count, 0u) << problems.shown[0].text;
     ASSERT_EQ(ours.dictionaryRepresentation(), test::oracleDictionary(plain));
     const std::vector<uint8_t> written = ours.data();
     ASSERT_EQ(std::string(written.begin(), written.end()), plainBytes);
@@ -71,6 +79,53 @@ TEST(OTAParamRCOracle, AgreesWithLibprotobufOnRandomModels) {
     EXPECT_EQ(std::tuple(copy->hash(), copy->data()), std::tuple(ours.hash(), written));
     EXPECT_TRUE(copy->isEqual(&ours) || !ours.isEqual(&ours));
   }
+}
+
+// Every input of wire_cases.txt that our reader decodes: when the wire check
+// finds nothing, libprotobuf parses it to the very values we read (but for an
+// MLBConfig the enum does not name, which our reader carries and libprotobuf
+// keeps apart as an unknown field, showing an earlier named value if any;
+// the daemon means to carry any value); when libprotobuf rejects it,
+// the check names why, and what it says libprotobuf rejects, it does.
+TEST(WireCheckOracle, NamesWhatLibprotobufRejectsOrReadsOtherwise) {
+  std::ifstream file(KOLVRAND_SOURCE_DIR "/tests/model/wire_cases.txt");
+  ASSERT_TRUE(file);
+  size_t flagged = 0, clean = 0;
+  for (std::string line; std::getline(file, line);) {
+    if (!line.starts_with("ok ")) continue;
+    SCOPED_TRACE(line);
+    const std::vector<uint8_t> input = test::fromHex(line.substr(3, line.find('/') - 3));
+    OTAParamRC ours;
+    ASSERT_TRUE(test::decode(ours, input));
+    rcmodel::WireProblems problems;
+    rcmodel::checkWire(input, 0, &problems);
+    kolvrand::oracle::OTAParamRC theirs;
+    const bool parsed = theirs.ParseFromArray(input.data(), static_cast<int>(input.size()));
+    if (problems.count > 0) {
+      // What the check says libprotobuf rejects, it does.
+      const bool rejects = std::ranges::any_of(problems.shown, [](const auto& p) {
+        return p.text.find("rejects the file") != std::string::npos;
+      });
+      EXPECT_TRUE(!rejects || !parsed) << problems.shown[0].text;
+      ++flagged;
+      continue;
+    }
+    ++clean;
+    ASSERT_TRUE(parsed);
+    const Value read = ours.dictionaryRepresentation();
+    const Value* named = read.asDictionary()->find("MLBConfig");
+    const bool unnamed = named && named->asString()->starts_with("(unknown");
+    const auto compared = [&](const Value& v) {
+      Dictionary d;
+      for (const auto& [key, value] : *v.asDictionary())
+        if (key != "MLBConfig" || !unnamed) d.set(key, value);
+      return Value(d);
+    };
+    EXPECT_EQ(compared(test::oracleDictionary(theirs)), compared(read));
+  }
+  // The file holds both kinds.
+  EXPECT_GT(flagged, 8u);
+  EXPECT_GT(clean, 5u);
 }
 
 }  // namespace

@@ -24,7 +24,7 @@ constexpr std::tuple<const char*, uint32_t, const char*> kExamples[] = {
     {"examples/models/R70/1552.rcmodel", 0x1552, "82e31811550188d291511afceeabad1880f62221"},
     {"examples/models/R71/1532.rcmodel", 0x1532, "e43e002abc201d5b3b81e6a19e330ad863e8391b"},
     {"examples/models/R72/1608a.rcmodel", 0x1608, "7d9bf1503bd5a43e22bee26ef1db71eb1a95b4ce"},
-    {"examples/models/R72/1608b.rcmodel", 0x1608, "7d9bf1503bd5a43e22bee26ef1db71eb1a95b4ce"},
+    {"examples/models/R72/1608b.rcmodel", 0x1608, "39487a168437bfd12cfa6df8382d64c1019f80b7"},
     {"examples/models/T604/1886.rcmodel", 0x1886, "9ef753e1d66f8cf2ffaa7706f5f3453c27d37788"},
     {"examples/models/T618e/2168.rcmodel", 0x2168, "1b50f4236af0c0adec44bb492118b90940445413"},
     {"examples/device/Library/KVR/BatteryModels/T618e/2168.rcmodel", 0x2168,

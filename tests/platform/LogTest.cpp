@@ -134,14 +134,14 @@ TEST(Concurrency, LogLinesOfThreadsNeverInterleave) {
   {
     std::vector<std::jthread> threads;
     for (int t = 0; t < 4; ++t) {
-      // A line feed within a message becomes a space: one message, one line.
+      // A line feed within a message shows as \n: one message, one line.
       threads.emplace_back([&, t] {
         for (int i = 0; i < 200; ++i)
           os_log(log, "thread %d\nmessage %d with some padding to make it longer\n", t, i);
       });
       for (int i = 0; i < 200; ++i)
         expected.insert("kolvrand[" + std::to_string(::getpid()) + "]: default [threads] thread " +
-                        std::to_string(t) + " message " + std::to_string(i) +
+                        std::to_string(t) + "\\nmessage " + std::to_string(i) +
                         " with some padding to make it longer\n");
     }
   }

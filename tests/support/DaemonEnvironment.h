@@ -17,16 +17,24 @@ extern char** environ;
 
 namespace kolvrand::test {
 
-// Owns the strings; envp() is what posix_spawn takes.
+// Owns the strings; envp() is what posix_spawn takes. `extra` ("NAME=VALUE")
+// replaces this process's variable of the same name.
 class DaemonEnvironment {
  public:
-  DaemonEnvironment(const std::filesystem::path& device, std::optional<std::string> logLevel) {
+  DaemonEnvironment(const std::filesystem::path& device, std::optional<std::string> logLevel,
+                    const std::vector<std::string>& extra = {}) {
+    const auto replaced = [&](std::string_view v) {
+      for (const std::string& e : extra)
+        if (v.starts_with(e.substr(0, e.find('=') + 1))) return true;
+      return false;
+    };
     for (char** e = environ; *e; ++e) {
       std::string_view v(*e);
       if (!v.starts_with("KOLVRAND_") && !v.starts_with("JOURNAL_STREAM=") &&
-          !v.starts_with("STATE_DIRECTORY="))
+          !v.starts_with("STATE_DIRECTORY=") && !replaced(v))
         strings_.emplace_back(v);
     }
+    strings_.insert(strings_.end(), extra.begin(), extra.end());
     strings_.push_back("KOLVRAND_DEVICE=" + device.string());
     if (logLevel) strings_.push_back("KOLVRAND_LOG_LEVEL=" + *logLevel);
     for (auto& s : strings_) pointers_.push_back(s.data());

@@ -147,7 +147,9 @@ TEST_F(Rcmodel, OutputsAreWrittenWhereTheyPoint) {
 
     for (const auto& [out, why] :
          {std::pair{"ro", "is a directory; give a file to write"},
-          {"ro/out", "cannot write: Permission denied; it was left as it was"}}) {
+          {"ro/out",
+           "cannot create a file in ro to replace it with: Permission denied; it was left as it "
+           "was"}}) {
       ToolRun refused = run(out, asUser);
       EXPECT_EQ(refused.status, 1);
       EXPECT_TRUE(matches(refused.err, std::string("^rcmodel [a-z]+: ") + out + ": " + why + "\n$"))
@@ -186,10 +188,13 @@ TEST_F(Rcmodel, ValidateReportsEveryListAgainstTheRecord) {
             1 + 1 + 1 + 16 * 2 + 1 + 22 + 1);
 }
 
+// A model the daemon refuses is drawn all the same, and the exit status says
+// it is refused.
 TEST_F(Rcmodel, PlotDrawsTheGridAndEveryTable) {
   const std::string model = exampleFile([](OTAParamRC& m) { m.setBaselineR4(nullptr); });
   ToolRun run = s.rcmodel({"plot", "-", "-o", "-"}, model);
-  ASSERT_EQ(run.status, 0) << run.err;
+  ASSERT_EQ(run.status, 1) << run.err;
+  EXPECT_TRUE(matches(run.err, "^rcmodel plot: -: the daemon would refuse this model")) << run.err;
   const std::string& svg = run.out;
   EXPECT_TRUE(svg.starts_with("<?xml") && svg.ends_with("</svg>\n")) << svg.substr(0, 100);
   auto count = [&](const char* what) {

@@ -106,30 +106,33 @@ void setList(OTAParamRC& m, void (OTAParamRC::*setter)(const float*, size_t),
 
 }  // namespace
 
-std::shared_ptr<OTAParamRC> makeExampleModel(uint32_t chemID) {
-  Jitter j(chemID);
+std::shared_ptr<OTAParamRC> makeExampleModel(uint32_t chemID, char variant) {
+  const bool second = variant == 'b';
+  Jitter j(second ? chemID ^ uint64_t{'b'} << 32 : chemID);
+  // Resistances and their extrapolation slopes scale alike.
+  const double r = second ? 1.08 : 1.0;
   auto m = std::make_shared<OTAParamRC>();
   m->setChemID(chemID);
 
   // The ohmic part (R0) is the smallest; the RC pairs at rising frequencies
   // follow; baselines are the same tables for a fresh cell.
-  m->setR0(table(j, 0.045));
-  m->setR1(table(j, 0.020));
-  m->setR2(table(j, 0.015));
-  m->setR3(table(j, 0.010));
-  m->setRCFreq1(table(j, 0.030));
-  m->setRCFreq2(table(j, 0.022));
-  m->setRCFreq3(table(j, 0.016));
-  m->setRCFreq4(table(j, 0.011));
-  m->setBaselineR0(table(j, 0.043));
-  m->setBaselineR1(table(j, 0.019));
-  m->setBaselineR2(table(j, 0.014));
-  m->setBaselineR3(table(j, 0.009));
-  m->setBaselineR4(table(j, 0.007));
-  m->setBaselineRCFreq1(table(j, 0.029));
-  m->setBaselineRCFreq2(table(j, 0.021));
-  m->setBaselineRCFreq3(table(j, 0.015));
-  m->setBaselineRCFreq4(table(j, 0.010));
+  m->setR0(table(j, r * 0.045));
+  m->setR1(table(j, r * 0.020));
+  m->setR2(table(j, r * 0.015));
+  m->setR3(table(j, r * 0.010));
+  m->setRCFreq1(table(j, r * 0.030));
+  m->setRCFreq2(table(j, r * 0.022));
+  m->setRCFreq3(table(j, r * 0.016));
+  m->setRCFreq4(table(j, r * 0.011));
+  m->setBaselineR0(table(j, r * 0.043));
+  m->setBaselineR1(table(j, r * 0.019));
+  m->setBaselineR2(table(j, r * 0.014));
+  m->setBaselineR3(table(j, r * 0.009));
+  m->setBaselineR4(table(j, r * 0.007));
+  m->setBaselineRCFreq1(table(j, r * 0.029));
+  m->setBaselineRCFreq2(table(j, r * 0.021));
+  m->setBaselineRCFreq3(table(j, r * 0.015));
+  m->setBaselineRCFreq4(table(j, r * 0.010));
 
   auto bmu = std::make_shared<OTABMUResistance>();
   bmu->setTraceResistance25C(static_cast<float>(0.0042 * (1 + 0.05 * j.next())));
@@ -159,10 +162,10 @@ std::shared_ptr<OTAParamRC> makeExampleModel(uint32_t chemID) {
     rdc.push_back(static_cast<float>(0.095 + 0.004 * i + 0.001 * j.next()));
   setList(*m, &OTAParamRC::setBaselineRdcs, rdc);
   setList(*m, &OTAParamRC::setGridOCVs, gridOCV(j));
-  setList(*m, &OTAParamRC::setSlopeForR0Extraps, slopes(j, 0.045));
-  setList(*m, &OTAParamRC::setSlopeForR1Extraps, slopes(j, 0.020));
-  setList(*m, &OTAParamRC::setSlopeForR2Extraps, slopes(j, 0.015));
-  setList(*m, &OTAParamRC::setSlopeForR3Extraps, slopes(j, 0.010));
+  setList(*m, &OTAParamRC::setSlopeForR0Extraps, slopes(j, r * 0.045));
+  setList(*m, &OTAParamRC::setSlopeForR1Extraps, slopes(j, r * 0.020));
+  setList(*m, &OTAParamRC::setSlopeForR2Extraps, slopes(j, r * 0.015));
+  setList(*m, &OTAParamRC::setSlopeForR3Extraps, slopes(j, r * 0.010));
 
   m->setMaxRdcRatio(2.5f);
   m->setMaxRdcRatioR2Extrap(3.0f);

@@ -1,6 +1,6 @@
 // Writes the example model files: one per device type of the chem-ID table
-// (chem ID 5640 in its "a" and "b" variants) under OUT/models, and the one the
-// example device loads under OUT/device/Library.
+// (chem ID 5640 in its "a" and "b" variants, two different cells) under
+// OUT/models, and the one the example device loads under OUT/device/Library.
 //
 //   kolvrand-example-models EXAMPLES_DIR
 #include <cstdio>
@@ -15,8 +15,8 @@ namespace {
 
 namespace fs = std::filesystem;
 
-bool writeModel(const fs::path& path, uint32_t chemID) {
-  std::shared_ptr<kolvrand::OTAParamRC> models[] = {kolvrand::makeExampleModel(chemID)};
+bool writeModel(const fs::path& path, uint32_t chemID, char variant) {
+  std::shared_ptr<kolvrand::OTAParamRC> models[] = {kolvrand::makeExampleModel(chemID, variant)};
   std::vector<uint8_t> bytes = kolvrand::PBStreamWriter::dataForMessages(
       std::span<const std::shared_ptr<kolvrand::OTAParamRC>>(models));
   std::error_code ec;
@@ -44,17 +44,18 @@ int main(int argc, char** argv) {
   struct {
     const char* file;
     uint32_t chemID;
+    char variant;
   } const models[] = {
-      {"models/R71/1532.rcmodel", 0x1532},
-      {"models/R70/1552.rcmodel", 0x1552},
-      {"models/R72/1608a.rcmodel", 0x1608},
-      {"models/R72/1608b.rcmodel", 0x1608},
-      {"models/K517/1821.rcmodel", 0x1821},
-      {"models/T618e/2168.rcmodel", 0x2168},
-      {"models/T604/1886.rcmodel", 0x1886},
-      {"device/Library/KVR/BatteryModels/T618e/2168.rcmodel", 0x2168},
+      {"models/R71/1532.rcmodel", 0x1532, 0},
+      {"models/R70/1552.rcmodel", 0x1552, 0},
+      {"models/R72/1608a.rcmodel", 0x1608, 'a'},
+      {"models/R72/1608b.rcmodel", 0x1608, 'b'},
+      {"models/K517/1821.rcmodel", 0x1821, 0},
+      {"models/T618e/2168.rcmodel", 0x2168, 0},
+      {"models/T604/1886.rcmodel", 0x1886, 0},
+      {"device/Library/KVR/BatteryModels/T618e/2168.rcmodel", 0x2168, 0},
   };
   bool ok = true;
-  for (const auto& m : models) ok = writeModel(out / m.file, m.chemID) && ok;
+  for (const auto& m : models) ok = writeModel(out / m.file, m.chemID, m.variant) && ok;
   return ok ? 0 : 1;
 }

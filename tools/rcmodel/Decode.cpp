@@ -1,4 +1,5 @@
 // rcmodel decode: a model file as JSON, one message per line.
+#include <algorithm>
 #include <cstdio>
 #include <span>
 
@@ -23,8 +24,9 @@ float; NaN and the infinities as "NaN", "Infinity" and "-Infinity".
           the message breaks off; the exit status is then 1.
 
 Exit status: 0 when every message decodes; 1 when the file cannot be read or
-decoded (the stream reader's description goes to stderr) or holds no message;
-2 for a wrong command line.
+decoded (the stream reader's description goes to stderr, and nothing is
+printed) or holds no message; 2 for a wrong command line. However many
+messages the file holds, each is printed and dropped before the next is read.
 )HELP";
 
 void print(const OTAParamRC& model) {
@@ -57,20 +59,29 @@ int run(const Arguments& a) {
     return kExitOK;
   }
 
+  // The whole file is decoded before anything is printed, so that a damaged
+  // message anywhere prints nothing; then again, one message at a time.
+  // Neither pass keeps more than one message, whatever their number.
   NSError why;
-  auto models =
-      PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(std::span<const uint8_t>(*bytes), &why);
-  if (!models) {
+  if (!forEachModel(*bytes, &why, [](const auto&, const auto&) { return true; })) {
     error(a.command, path + ": " + why.localizedDescription +
                          "; if it holds one bare message without its length, use --raw");
     return kExitFailed;
   }
-  if (models->empty()) {
+  if (bytes->empty()) {
     error(a.command, path + ": " + kNoMessage);
     return kExitFailed;
   }
-  for (const auto& model : *models) print(*model);
-  return std::fflush(stdout) == 0 ? kExitOK : kExitFailed;
+  // A message of the same bytes as the one before prints the same line.
+  std::span<const uint8_t> previous;
+  std::string line;
+  forEachModel(*bytes, &why, [&](const auto& model, const PBStreamReader::Frame& frame) {
+    if (line.empty() || !std::ranges::equal(frame.body, previous))
+      line = renderJSON(model->dictionaryRepresentation()) + '\n';
+    previous = frame.body;
+    return std::fwrite(line.data(), 1, line.size(), stdout) == line.size();
+  });
+  return std::fflush(stdout) == 0 && !std::ferror(stdout) ? kExitOK : kExitFailed;
 }
 
 }  // namespace

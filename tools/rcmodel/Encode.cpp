@@ -3,7 +3,8 @@
 #include <span>
 
 #include "model/OTAParamRC.h"
-#include "pipeline/PBStreamWriter.h"
+#include "model/Wire.h"
+#include "pipeline/PBStreamReader.h"
 #include "tools/rcmodel/ModelJSON.h"
 #include "tools/rcmodel/Tool.h"
 
@@ -31,8 +32,13 @@ to the nearest 32-bit float, or "NaN", "Infinity", "-Infinity". "chemID" is an
 integer from 0 to 4294967295. "MLBConfig" is "kKVRRegularMLB",
 "kKVRNorthSouthSplitMLB", "(unknown: N)" or an integer.
 
+A model file the daemon would refuse for its size (more than 4194304 bytes)
+is refused before anything is written. JSON is read from a regular file (or
+standard input) of at most 67108864 bytes.
+
 Exit status: 0 when FILE was written; 1 when it could not be written; 2 for a
-wrong command line or wrong JSON, with the JSON path of the first wrong value.
+wrong command line or wrong JSON, with the JSON path of the first wrong value,
+or JSON whose model file would be too large.
 )HELP";
 
 int run(const Arguments& a) {
@@ -42,10 +48,35 @@ int run(const Arguments& a) {
 
   auto text = readInput(a.command, path);
   if (!text) return kExitUsage;
+
+  // Each model is encoded as soon as its JSON is read, and the file stops
+  // growing at the size the daemon reads; nothing is written before the
+  // whole JSON has been read.
+  constexpr size_t kLimit = PBStreamReader::kMaxFileSize;
+  std::vector<uint8_t> bytes;
+  size_t used = 0;
   JSONError why;
-  auto models = modelsFromJSON(
-      std::string_view(reinterpret_cast<const char*>(text->data()), text->size()), a.raw, &why);
-  if (!models) {
+  const bool ok = forEachModelInJSON(
+      *text, a.raw, {kLimit, &used}, &why,
+      [&](std::shared_ptr<OTAParamRC> model, JSONError* refused) {
+        const size_t size = model->encodedSize();
+        const size_t framed = a.raw ? size : wire::varintSize(size) + size;
+        if (framed > kLimit - used) {
+          refused->reason = "with this model the file would be larger than the " +
+                            std::to_string(kLimit) +
+                            "-byte limit of a model file, which the daemon refuses";
+          return false;
+        }
+        used += framed;
+        std::vector<uint8_t> message = model->data();
+        if (!a.raw) {
+          uint8_t length[wire::kMaxVarintSize];
+          bytes.insert(bytes.end(), length, length + wire::encodeVarint(length, message.size()));
+        }
+        bytes.insert(bytes.end(), message.begin(), message.end());
+        return true;
+      });
+  if (!ok) {
     std::string hint;
     if (why.reason.starts_with("expected a float"))
       hint = " (NaN and the infinities are written \"NaN\", \"Infinity\", \"-Infinity\")";
@@ -54,13 +85,6 @@ int run(const Arguments& a) {
     error(a.command,
           (path == "-" ? "stdin" : path) + ": " + why.message() + hint + "; nothing was written");
     return kExitUsage;
-  }
-
-  std::vector<uint8_t> bytes;
-  if (a.raw) {
-    bytes = models->front()->data();
-  } else {
-    bytes = PBStreamWriter::dataForMessages(std::span<const std::shared_ptr<OTAParamRC>>(*models));
   }
   if (!writeOutput(a.command, *a.output,
                    std::string_view(reinterpret_cast<const char*>(bytes.data()), bytes.size())))

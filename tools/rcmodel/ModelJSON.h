@@ -5,6 +5,7 @@
 // dictionary import, so no field is listed here.
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -34,17 +35,40 @@ struct JSONError {
   std::string message() const { return path + ": " + reason; }
 };
 
-// JSON text as a Value: a number with a fraction or an exponent becomes the
-// 32-bit float nearest to its decimal text when it is within a float's range
-// (else a double, which a float field rounds or refuses), the strings "NaN",
-// "Infinity" and "-Infinity" become floats, integers stay integers. Null,
+// JSON text as a Value: every number that is an integer, however written
+// (12, 1.2e1, 12.0), becomes an integer of exactly its value when it fits 64
+// bits; any other number becomes the 32-bit float nearest to its decimal text
+// when it is within a float's range (else a double, which a float field
+// rounds or refuses, and never zero for a number that is not), negative zero
+// a float; the strings "NaN", "Infinity" and "-Infinity" become floats. Null,
 // duplicate keys and numbers beyond any range are errors.
 std::optional<Value> parseJSON(std::string_view text, JSONError* error);
+
+// `path` below `root`: "$" and "R0.resistance25C[3]" give "$.R0.resistance25C[3]".
+std::string below(const std::string& root, const std::string& path);
+
+// What the models of a text may take once encoded: `limit` bytes, of which
+// *used are taken already (the caller counts what it has encoded); no limit
+// without `used`.
+struct ModelBudget {
+  size_t limit = 0;
+  const size_t* used = nullptr;
+};
+
+// Takes one model; false after setting the error's reason stops the reading.
+using TakeModel = std::function<bool(std::shared_ptr<OTAParamRC>, JSONError*)>;
 
 // The models of a JSON text: an object is one model, an array of objects
 // several, and so are JSON Lines, one object a line (what rcmodel decode
 // prints). At least one model; nothing may follow the JSON, not even after a
-// NUL byte. With `single`, only one object is taken.
+// NUL byte. With `single`, only one object is taken. Each model is handed to
+// `take` as soon as its JSON is read and imported, so that memory holds the
+// values of one model at a time; with a budget, a model whose encoding cannot
+// fit what is left of it is refused while it is read.
+bool forEachModelInJSON(std::string_view text, bool single, const ModelBudget& budget,
+                        JSONError* error, const TakeModel& take);
+
+// The same, all models kept.
 std::optional<std::vector<std::shared_ptr<OTAParamRC>>> modelsFromJSON(std::string_view text,
                                                                        bool single,
                                                                        JSONError* error);

@@ -71,16 +71,24 @@ fs::path finalTarget(fs::path path, int* err, int* fd) {
 }
 
 // Replaces `target` with a file holding `bytes`, keeping the mode (and, for
-// root, the owner) of the file it replaces; 0 or an errno value.
-int replaceFile(const fs::path& target, std::string_view bytes) {
+// root, the owner) of the file it replaces; 0, or an errno value with *step
+// naming the step that failed.
+int replaceFile(const fs::path& target, std::string_view bytes, std::string* step) {
   fs::path dir = target.parent_path();
   if (dir.empty()) dir = ".";
-  std::string temporary = (dir / ("." + target.filename().string() + ".XXXXXX")).string();
+  std::string name = ".";
+  name += target.filename().string();
+  name += ".XXXXXX";
+  std::string temporary = (dir / name).string();
   const int fd = ::mkstemp(temporary.data());
-  if (fd < 0) return errno;
+  if (fd < 0) {
+    *step = "cannot create a file in " + dir.string() + " to replace it with";
+    return errno;
+  }
 
   int err = 0;
   struct stat old {};
+  *step = "cannot give the new file the old one's mode";
   if (::stat(target.c_str(), &old) == 0) {
     if (::fchmod(fd, old.st_mode & 07777) != 0) err = errno;
     if (!err && ::geteuid() == 0 && ::fchown(fd, old.st_uid, old.st_gid) != 0) err = errno;
@@ -90,10 +98,11 @@ int replaceFile(const fs::path& target, std::string_view bytes) {
     ::umask(mask);
     if (::fchmod(fd, 0666 & ~mask) != 0) err = errno;
   }
-  if (!err && !writeAll(fd, bytes)) err = errno;
-  if (!err && ::fsync(fd) != 0) err = errno;
-  if (::close(fd) != 0 && !err) err = errno;
-  if (!err && ::rename(temporary.c_str(), target.c_str()) != 0) err = errno;
+  if (!err && !writeAll(fd, bytes)) err = errno, *step = "cannot write the new file";
+  if (!err && ::fsync(fd) != 0) err = errno, *step = "cannot sync the new file";
+  if (::close(fd) != 0 && !err) err = errno, *step = "cannot close the new file";
+  if (!err && ::rename(temporary.c_str(), target.c_str()) != 0)
+    err = errno, *step = "cannot rename the new file over it";
   if (err) ::unlink(temporary.c_str());
   return err;
 }
@@ -149,9 +158,10 @@ bool writeOutput(const std::string& command, const std::string& path, std::strin
     }
     return true;
   }
-  if (!err) err = replaceFile(target, bytes);
+  std::string step = "cannot write";
+  if (!err) err = replaceFile(target, bytes, &step);
   if (err) {
-    error(command, path + ": cannot write: " + std::strerror(err) + "; it was left as it was");
+    error(command, path + ": " + step + ": " + std::strerror(err) + "; it was left as it was");
     return false;
   }
   return true;

@@ -7,7 +7,10 @@
 #include <span>
 
 #include "model/OTAParamRC.h"
+#include "pipeline/BatteryModelDataHandler.h"
+#include "pipeline/KextBatteryModel.h"
 #include "pipeline/KextBatteryModelSources.h"
+#include "platform/Utf8.h"
 #include "tools/rcmodel/ModelJSON.h"
 #include "tools/rcmodel/Tool.h"
 
@@ -25,8 +28,13 @@ dashed curve per band). The state-of-charge axis assumes evenly spaced points.
 A table the model lacks is shown as missing. The header lists the model's
 single values and its board resistances.
 
-Exit status: 0 when OUT.svg was written; 1 when FILE cannot be decoded or
-OUT.svg cannot be written; 2 for a wrong command line.
+The file's name in the title shows control characters and bytes that are no
+UTF-8 as escapes (\n, \x1b), so that the picture is valid XML whatever the name.
+
+Exit status: 0 when OUT.svg was written and the daemon would load the model;
+1 when FILE cannot be decoded, OUT.svg cannot be written, or the daemon would
+refuse the model (OUT.svg is written all the same, to show what the model
+holds); 2 for a wrong command line.
 )HELP";
 
 constexpr double kWidth = 1280;
@@ -38,9 +46,21 @@ constexpr const char* kColors[] = {"#1f77b4", "#d62728", "#2ca02c", "#9467bd",
                                    "#ff7f0e", "#8c564b", "#e377c2", "#17becf"};
 constexpr size_t kOCVPoints = 101;
 
-std::string escape(std::string_view text) {
+// Text as XML character data or an attribute value: the markup characters
+// as entities; control characters and bytes that are no UTF-8, which XML
+// does not allow even as references, as visible escapes; and the two
+// noncharacters U+FFFE and U+FFFF, which XML does not allow either.
+std::string escape(std::string_view raw) {
+  const std::string text = visibleText(raw);
   std::string out;
-  for (char c : text) {
+  for (size_t i = 0; i < text.size(); ++i) {
+    const char c = text[i];
+    if (c == '\xef' && i + 2 < text.size() && text[i + 1] == '\xbf' &&
+        (text[i + 2] == '\xbe' || text[i + 2] == '\xbf')) {
+      out += text[i + 2] == '\xbe' ? "\\ufffe" : "\\uffff";
+      i += 2;
+      continue;
+    }
     switch (c) {
       case '&':
         out += "&amp;";
@@ -383,7 +403,15 @@ int run(const Arguments& a) {
   std::shared_ptr<OTAParamRC> model = readFirstModel(a.command, path);
   if (!model) return kExitFailed;
   const std::string name = path == "-" ? "(stdin)" : path.substr(path.rfind('/') + 1);
-  return writeOutput(a.command, *a.output, drawing(*model, name)) ? kExitOK : kExitFailed;
+  if (!writeOutput(a.command, *a.output, drawing(*model, name))) return kExitFailed;
+  // The verdict is the daemon's own builder's, as validate's is.
+  BatteryModelDataHandler quiet;
+  if (!quiet.createKextModelFromProtobufModel(model.get())) {
+    error(a.command, path + ": the daemon would refuse this model; the picture shows what it " +
+                         "holds, rcmodel validate " + path + " tells why");
+    return kExitFailed;
+  }
+  return kExitOK;
 }
 
 }  // namespace

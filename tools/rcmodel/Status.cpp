@@ -15,6 +15,7 @@
 #include "platform/Backend.h"
 #include "platform/CommonCrypto.h"
 #include "platform/Defaults.h"
+#include "platform/Utf8.h"
 #include "tools/rcmodel/Tool.h"
 
 namespace kolvrand::rcmodel {
@@ -37,6 +38,13 @@ hash the driver publishes, and a verdict:
             changed since the upload, or the upload was not confirmed)
   missing   there is no model file, or it does not decode, or the daemon would
             refuse it
+  unknown   the daemon's settings (as for a user who may not read its state
+            directory) or the boot session cannot be read, so whether the
+            daemon uploaded in this boot session cannot be told; the report
+            says why
+
+Every value read from the device is shown with control characters and bytes
+that are no UTF-8 as escapes (\n, \x1b).
 
 Nothing is uploaded and nothing is written. Exit status: 0 when the report was
 printed, whatever the verdict; 2 for a wrong command line.
@@ -61,8 +69,10 @@ class Collect : public LogSink {
   std::vector<std::string> lines_;
 };
 
+// One line of the report; `value` is shown as visibleText shows it, since it
+// comes from the device (a target type, a path, a line the daemon logged).
 void line(const char* key, const std::string& value) {
-  std::printf("%-20s %s\n", (std::string(key) + ":").c_str(), value.c_str());
+  std::printf("%-20s %s\n", (std::string(key) + ":").c_str(), visibleText(value).c_str());
 }
 
 std::string orNone(const std::optional<std::string>& s) {
@@ -97,12 +107,17 @@ int run(const Arguments& a) {
   const std::optional<std::string> current = currentBootSessionUUID();
   std::optional<std::string> saved;
   bool thisSession = false;
-  if (auto defaults = NSUserDefaults::openExistingSuiteNamed(DaemonIdentifier)) {
+  // Settings that cannot be read are not settings that are absent: whether
+  // the daemon uploaded in this boot session is then unknown.
+  std::string unreadable;
+  if (auto defaults = NSUserDefaults::openExistingSuiteNamed(DaemonIdentifier, &unreadable)) {
     saved = defaults->stringForKey("savedBootUUID");
     thisSession = current && isSavedBootSession(*defaults, *current);
   }
   line("boot session", current ? *current : "(cannot be read)");
-  line("saved boot session", orNone(saved) + (thisSession ? " (this boot session)" : ""));
+  line("saved boot session", !unreadable.empty()
+                                 ? "(cannot be read: " + unreadable + ")"
+                                 : orNone(saved) + (thisSession ? " (this boot session)" : ""));
 
   // A handler without defaults reads the chem ID without storing it.
   auto handler = std::make_shared<BatteryModelDataHandler>();
@@ -142,6 +157,8 @@ int run(const Arguments& a) {
   const char* verdict = "loaded";
   if (!recordHash)
     verdict = "missing";
+  else if (!current || !unreadable.empty())
+    verdict = "unknown";
   else if (!thisSession)
     verdict = "stale";
   else if (!published || *published != Data(recordHash->begin(), recordHash->end()))
@@ -155,7 +172,7 @@ int run(const Arguments& a) {
     if (std::find(lines.begin(), lines.end(), l) == lines.end()) lines.push_back(l);
   if (!lines.empty()) {
     std::printf("\nthe daemon's code logged:\n");
-    for (const std::string& l : lines) std::printf("  %s\n", l.c_str());
+    for (const std::string& l : lines) std::printf("  %s\n", visibleText(l).c_str());
   }
   std::fflush(stdout);
   setLogSink(nullptr);

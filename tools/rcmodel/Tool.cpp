@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
@@ -12,7 +13,9 @@
 
 #include "model/OTAParamRC.h"
 #include "pipeline/PBStreamReader.h"
+#include "platform/FileManager.h"
 #include "platform/Log.h"
+#include "platform/Utf8.h"
 
 namespace kolvrand::rcmodel {
 
@@ -24,16 +27,17 @@ class StderrSink : public LogSink {
   void write(LogLevel, std::string_view, std::string_view, std::string_view message) override {
     while (!message.empty() && (message.back() == '\n' || message.back() == ' '))
       message.remove_suffix(1);
-    std::fprintf(stderr, "%s: %.*s\n", prefix_.c_str(), static_cast<int>(message.size()),
-                 message.data());
+    const std::string line = prefix_ + ": " + visibleText(message) + "\n";
+    std::fwrite(line.data(), 1, line.size(), stderr);
   }
 
  private:
   std::string prefix_;
 };
 
-std::optional<std::vector<uint8_t>> readStdin(const std::string& command, size_t limit) {
-  std::vector<uint8_t> bytes;
+template <typename Bytes>
+std::optional<Bytes> readStdin(const std::string& command, size_t limit, const char* kind) {
+  Bytes bytes;
   uint8_t buffer[65536];
   for (;;) {
     ssize_t n = ::read(STDIN_FILENO, buffer, sizeof buffer);
@@ -46,21 +50,9 @@ std::optional<std::vector<uint8_t>> readStdin(const std::string& command, size_t
     bytes.insert(bytes.end(), buffer, buffer + n);
     if (bytes.size() > limit) {
       error(command, "standard input is larger than the " + std::to_string(limit) +
-                         "-byte limit; give a file instead");
+                         "-byte limit for " + kind);
       return std::nullopt;
     }
-  }
-}
-
-// The stream reader's buffer type is its own business (a vector, or a buffer
-// with bytes()); a model is small enough to copy.
-template <typename Contents>
-std::vector<uint8_t> copyBytes(const Contents& contents) {
-  if constexpr (requires { contents.bytes(); }) {
-    const auto bytes = contents.bytes();
-    return std::vector<uint8_t>(bytes.begin(), bytes.end());
-  } else {
-    return std::vector<uint8_t>(contents.begin(), contents.end());
   }
 }
 
@@ -105,7 +97,8 @@ int runCommand(const Command& command, const std::vector<std::string>& args) {
 }
 
 void error(const std::string& command, const std::string& message) {
-  std::fprintf(stderr, "rcmodel %s: %s\n", command.c_str(), message.c_str());
+  const std::string line = "rcmodel " + command + ": " + visibleText(message) + "\n";
+  std::fwrite(line.data(), 1, line.size(), stderr);
 }
 
 int usageError(const std::string& command, const std::string& message) {
@@ -113,46 +106,34 @@ int usageError(const std::string& command, const std::string& message) {
   return kExitUsage;
 }
 
-std::optional<std::vector<uint8_t>> readInput(const std::string& command, const std::string& path) {
-  // JSON written by hand is small; the limit only guards against the wrong file.
-  constexpr size_t kLimit = 256 * 1024 * 1024;
-  if (path == "-") return readStdin(command, kLimit);
-  std::error_code ec;
-  if (std::filesystem::is_directory(path, ec)) {
-    error(command, path + ": is a directory; give a file");
+std::optional<std::string> readInput(const std::string& command, const std::string& path) {
+  if (path == "-") return readStdin<std::string>(command, kMaxJSONSize, "JSON");
+  std::string why;
+  int err = 0;
+  auto text = readSmallFile(path, kMaxJSONSize, &why, &err);
+  if (!text) {
+    const std::string limit = std::to_string(kMaxJSONSize) + "-byte limit";
+    error(command, path + ": " + why +
+                       (err == EFBIG    ? " for JSON; a model file's JSON needs far less"
+                        : err == EINVAL ? "; give a JSON file (of at most the " + limit +
+                                              "), or - to read standard input"
+                                        : "; check the file's path"));
     return std::nullopt;
   }
-  std::FILE* file = std::fopen(path.c_str(), "rb");
-  if (!file) {
-    error(command, path + ": cannot open: " + std::strerror(errno) + "; check the file's path");
-    return std::nullopt;
-  }
-  std::vector<uint8_t> bytes;
-  uint8_t buffer[65536];
-  size_t n = 0;
-  while ((n = std::fread(buffer, 1, sizeof buffer, file)) > 0) {
-    bytes.insert(bytes.end(), buffer, buffer + n);
-    if (bytes.size() > kLimit) break;
-  }
-  const bool failed = std::ferror(file) || bytes.size() > kLimit;
-  std::fclose(file);
-  if (failed) {
-    error(command, path + ": cannot read it whole");
-    return std::nullopt;
-  }
-  return bytes;
+  return text;
 }
 
 std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
                                                    const std::string& path) {
-  if (path == "-") return readStdin(command, PBStreamReader::kMaxFileSize);
+  if (path == "-")
+    return readStdin<std::vector<uint8_t>>(command, PBStreamReader::kMaxFileSize, "a model file");
   NSError why;
   auto file = PBStreamReader::readFile(path, &why);
   if (!file) {
     error(command, why.localizedDescription + "; give the path of a model file");
     return std::nullopt;
   }
-  return copyBytes(*file);
+  return file;
 }
 
 void routeLogToStderr(const std::string& command) {
@@ -160,24 +141,49 @@ void routeLogToStderr(const std::string& command) {
   setLogLevelSpec("error");
 }
 
+bool forEachModel(std::span<const uint8_t> file, NSError* why,
+                  const std::function<bool(const std::shared_ptr<OTAParamRC>&,
+                                           const PBStreamReader::Frame&)>& take) {
+  std::shared_ptr<OTAParamRC> model;
+  std::span<const uint8_t> previous;
+  bool decoded = true;
+  const bool framed = PBStreamReader::forEachFrame(file, why, [&](const auto& frame) {
+    if (!model || !std::ranges::equal(frame.body, previous)) {
+      model = std::make_shared<OTAParamRC>();
+      PBDataReader reader(frame.body.data(), frame.body.size());
+      if (!model->readFrom(reader)) {
+        if (why) *why = PBStreamReader::messageError(frame.index, frame.offset);
+        return decoded = false;
+      }
+      previous = frame.body;
+    }
+    return take(model, frame);
+  });
+  return framed && decoded;
+}
+
 std::shared_ptr<OTAParamRC> readFirstModel(const std::string& command, const std::string& path,
                                            size_t* count) {
   auto bytes = readModelInput(command, path);
   if (!bytes) return nullptr;
   NSError why;
-  auto models =
-      PBStreamReader::readProtoBuffersOfClass<OTAParamRC>(std::span<const uint8_t>(*bytes), &why);
-  if (!models) {
+  std::shared_ptr<OTAParamRC> first;
+  size_t messages = 0;
+  if (!forEachModel(*bytes, &why, [&](const auto& m, const auto&) {
+        if (!first) first = m;
+        ++messages;
+        return true;
+      })) {
     error(command, path + ": " + why.localizedDescription +
                        "; check that it is a model file (rcmodel decode shows its messages)");
     return nullptr;
   }
-  if (count) *count = models->size();
-  if (models->empty()) {
+  if (count) *count = messages;
+  if (!first) {
     error(command, path + ": " + kNoMessage);
     return nullptr;
   }
-  return models->front();
+  return first;
 }
 
 }  // namespace kolvrand::rcmodel

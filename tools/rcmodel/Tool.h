@@ -2,12 +2,15 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
+
+#include "pipeline/PBStreamReader.h"
 
 namespace kolvrand {
 class OTAParamRC;
@@ -58,15 +61,21 @@ int runCommand(const Command& command, const std::vector<std::string>& args);
 inline constexpr const char* kNoMessage =
     "holds no message; a model file holds at least one OTAParamRC message";
 
-// Prints "rcmodel COMMAND: MESSAGE" on stderr, one line.
+// Prints "rcmodel COMMAND: MESSAGE" on stderr, one line: control characters
+// and bytes that are no UTF-8 (of a file name, of a key) show as escapes.
 void error(const std::string& command, const std::string& message);
 // A usage error: the message and where to read more; returns kExitUsage.
 int usageError(const std::string& command, const std::string& message);
 
+// The most JSON rcmodel reads: a model file holds at most 4 MiB, and its JSON,
+// printed with indentation, some five times that.
+inline constexpr size_t kMaxJSONSize = 64 * 1024 * 1024;
+
 // The bytes of FILE, or of standard input for "-"; nullopt after reporting.
-// Model files are read by the daemon's stream reader, with its checks and
-// its error descriptions.
-std::optional<std::vector<uint8_t>> readInput(const std::string& command, const std::string& path);
+// A file is read as every file is: a regular file (a FIFO is refused without
+// waiting for a writer), at most kMaxJSONSize bytes. Model files are read by
+// the daemon's stream reader, with its checks and its error descriptions.
+std::optional<std::string> readInput(const std::string& command, const std::string& path);
 std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,
                                                    const std::string& path);
 // Writes `bytes` to standard output for "-", else to PATH: a regular file (or
@@ -82,7 +91,18 @@ bool isStandardOutput(const std::string& path);
 // only errors enabled: the daemon's own refusals show, its chatter does not.
 void routeLogToStderr(const std::string& command);
 
-// The file's messages as the daemon's stream reader reads them; nullptr after
+// Every message of a model file, decoded as the daemon's stream reader
+// decodes it and handed to `take(model, frame)` (which returns false to stop
+// early), one at a time and dropped after: memory stays that of one message
+// however many the file holds. A message of the very bytes of the one before
+// is not decoded again, and `take` gets the same model. false with *why when
+// a message cannot be framed or decoded.
+bool forEachModel(std::span<const uint8_t> file, NSError* why,
+                  const std::function<bool(const std::shared_ptr<OTAParamRC>&,
+                                           const PBStreamReader::Frame&)>& take);
+
+// The file's first message as the daemon's stream reader reads the file
+// (every message decoded, one at a time, and dropped); nullptr after
 // reporting the reader's error. *count receives the number of messages.
 std::shared_ptr<OTAParamRC> readFirstModel(const std::string& command, const std::string& path,
                                            size_t* count = nullptr);

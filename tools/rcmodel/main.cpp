@@ -23,7 +23,8 @@ Commands:
   status                           what the daemon on this device would load, and whether
                                    the driver holds it (read-only)
 
-Run `rcmodel COMMAND --help` for the details of one command.
+Run `rcmodel COMMAND --help` for the details of one command, `rcmodel --version`
+for the version (that of the daemon whose code it runs).
 
 Exit status: 0 on success; 1 when a model cannot be decoded, would be refused by
 the daemon, or a file cannot be read or written; 2 for a wrong command line or
@@ -49,6 +50,10 @@ int main(int argc, char** argv) {
   const std::string& name = args.front();
   if (name == "-h" || name == "--help" || name == "help") {
     std::fputs(kUsage, stdout);
+    return kolvrand::rcmodel::kExitOK;
+  }
+  if (name == "--version" && args.size() == 1) {
+    std::printf("rcmodel %s\n", KOLVRAND_VERSION);
     return kolvrand::rcmodel::kExitOK;
   }
   for (const kolvrand::rcmodel::Command* command : kCommands)
