@@ -2,7 +2,7 @@
 // Its rows are grouped by the class of input they stand for (the string before
 // a group names the class). Each row says what is put on a fresh copy of the
 // example device ("given": path -> what, below) and then either
-//   "sh": a shell command run there, rcmodel first on its PATH, with its exit
+//   "sh": a shell command run there, rcmodel and kolvrand first on its PATH, with its exit
 //     "status", patterns its standard output ("stdout") and error ("stderr")
 //     must match (an error without a pattern must be empty, "not" one that
 //     neither may), and "most": the memory (MiB of peak resident set) and time
@@ -187,8 +187,8 @@ TEST_P(HostileInput, IsRefusedOrBoundedAsItsRowSays) {
     // limits are for the program's own.
     const DaemonEnvironment env(
         device.dir, std::nullopt,
-        {"PATH=" + std::string(KOLVRAND_BINARY_DIR) +
-             "/tools/rcmodel:" + (path ? path : "/usr/bin:/bin"),
+        {"PATH=" + std::string(KOLVRAND_BINARY_DIR) + "/tools/rcmodel:" + KOLVRAND_BINARY_DIR +
+             "/daemon:" + (path ? path : "/usr/bin:/bin"),
          "ASAN_OPTIONS=" + std::string(asan ? asan : "") + ":quarantine_size_mb=8",
          "EXAMPLES=" + std::string(KOLVRAND_SOURCE_DIR) + "/examples"});
     const pid_t pid = spawnProgram(launcher, env, files, device.dir);
