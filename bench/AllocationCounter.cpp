@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The allocator of the benchmark binary: glibc's, behind counters. Defining
 // the malloc family in the executable replaces it for every library (glibc
 // documents this as replacing malloc); __libc_* are glibc's own entry points.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Counts every heap allocation of the process: the malloc family is replaced
 // in this binary (forwarding to glibc's allocator), so operator new, the C
 // library and every other library are all seen.

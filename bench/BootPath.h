@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The driver side of the boot path, in memory: the benchmark measures the
 // daemon's work, not the simulated device's file writes (which stand for the
 // kernel's).

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The boot path: from the model file on disk to a verified upload (locate,
 // read, decode, record, SHA-1, upload, verify), against its lower bound: read
 // the file and take the SHA-1 of 29056 bytes.

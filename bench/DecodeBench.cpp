@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Decoding one full-size model: our reader against libprotobuf's generated
 // parser and a hand-written protozero loop, on the same bytes, each building a
 // fresh result per model and dropping it again.

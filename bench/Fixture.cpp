@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "bench/Fixture.h"
 
 #include <cstdio>

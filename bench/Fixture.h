@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // What every benchmark works on: the full-size example model in its two
 // encodings, and the model file the example device loads.
 #pragma once

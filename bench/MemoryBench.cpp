@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Memory: the real daemon's peak resident set through one battery-model task
 // on a copy of the example device, and the heap allocations of one task.
 #include <benchmark/benchmark.h>

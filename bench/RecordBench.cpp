@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Building the 29056-byte kernel record from a decoded model, against the
 // least any builder must do: copy 29056 bytes.
 #include <benchmark/benchmark.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Runs every benchmark, then prints the ratios the targets are stated in,
 // each from the medians of the repetitions of this one run.
 #include <benchmark/benchmark.h>

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: MIT
 # libprotobuf's classes for the shipped schema, the reference our messages are
 # checked and measured against (tests, fuzzing, benchmarks; never the daemon or
 # rcmodel). Two copies of the schema are generated: STEM_plain under PACKAGE,

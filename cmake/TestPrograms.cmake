@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: MIT
 # The path at which a test starts one of the project's programs.
 #
 #   kolvrand_test_program(VAR TARGET)

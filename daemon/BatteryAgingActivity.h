@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The battery-aging activity: the system runs it by the criteria of the launch
 // configuration; its handler records the run in "updateConditionMet" and
 // consumes the flag in the same call.

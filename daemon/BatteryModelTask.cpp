@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "daemon/BatteryModelTask.h"
 
 #include <memory>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The boot-session gate: uploads the battery model at most once per boot
 // session, judged by the kernel's boot-session UUID, which is remembered in
 // "savedBootUUID" only after a successful upload.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "daemon/ConditionCheckingAgent.h"
 
 namespace kolvrand {

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The process-wide object whose defaults hold the battery-aging flag.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // kolvrand: once per boot session, uploads the battery model to the kernel
 // power-management driver; keeps the battery-aging activity registered.
 #include <cstdio>

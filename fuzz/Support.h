@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Helpers shared by the fuzz targets: a check that aborts (so libFuzzer keeps
 // the input), and a log sink that formats every message and drops it.
 #pragma once

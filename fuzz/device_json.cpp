@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Feeds arbitrary text to the simulated device's device.json parser, then asks
 // the device what the daemon asks: kernel variables, registry properties, the
 // driver. Whatever the file holds, the device must come up, malformed input

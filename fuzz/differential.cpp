@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Differential decoding against libprotobuf. Each input that libprotobuf
 // parses as a model becomes a valid message in its canonical form (unknown
 // fields dropped, each field once), written both unpacked and packed; our

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Feeds arbitrary bytes to the model-file stream reader, the way the daemon
 // reads a model file, and turns the first message into the kernel record.
 // A stream that reads must survive being written out and read again, and a

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Feeds arbitrary text to rcmodel's JSON import, the way `rcmodel encode`
 // reads a model author's file. Whatever imports must export and import again
 // to the very same model, and its encoding must read back unchanged.

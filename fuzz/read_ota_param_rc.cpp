@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Feeds arbitrary bytes to the battery model's read function. Whatever reads
 // successfully must survive a write and a second read unchanged.
 #include "fuzz/Support.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Macros that turn a message's field list into its slots, accessors and
 // table rows, so that each field is named, numbered and keyed exactly once.
 //

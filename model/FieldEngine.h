@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The message operations, written once over a field table and the message's
 // storage. Fields are visited in table order (ascending field number).
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Taking a message's dictionary form back into the message: the reverse of
 // dictionaryOfFields, driven by the same table of keys and kinds, so that the
 // tools that read models written by hand never keep a field list of their own.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The stored values of a message: one array per kind of field, indexed by the
 // slots of its field table, and the has-bit record.
 #pragma once

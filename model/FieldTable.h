@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Field descriptors: one row per field of a message class, giving its number,
 // kind, storage slot, presence bit and dictionary key. A message's table is
 // the single description of its fields that every message operation walks.

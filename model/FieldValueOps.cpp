@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "model/FieldEngine.h"
 #include "model/FloatHash.h"
 #include "model/PBCodable.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The hash term of one optional float field.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The common body of the message classes: every PBCodable operation, and the
 // typed copyTo / copy / mergeFrom, forwarded to the field engine with the
 // class's own table. A message class derives from

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The one exception of the message classes: an element index at or past the
 // end of a repeated field.
 #pragma once

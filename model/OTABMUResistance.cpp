@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "model/OTABMUResistance.h"
 
 namespace kolvrand {

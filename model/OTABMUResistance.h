@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The resistances of the board's current path between battery and system.
 #pragma once
 

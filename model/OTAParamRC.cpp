@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "model/OTAParamRC.h"
 
 namespace kolvrand {

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The battery model: the root message of a model file.
 #pragma once
 

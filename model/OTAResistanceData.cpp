@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "model/OTAResistanceData.h"
 
 namespace kolvrand {

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // A resistance table of the battery model: values at 25 °C and their
 // temperature coefficients.
 #pragma once

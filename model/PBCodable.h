@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The base of every message class: what a message can do without its caller
 // knowing which message it is.
 #pragma once

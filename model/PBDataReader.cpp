@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "model/PBDataReader.h"
 
 namespace kolvrand {

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // A cursor over one encoded message: the bytes, the read position, the limit at
 // which the current (sub-)message ends, and a sticky error flag. The read
 // functions of the messages work on this state directly.

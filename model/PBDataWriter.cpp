@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "model/PBDataWriter.h"
 
 #include "model/PBCodable.h"

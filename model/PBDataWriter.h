@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Appends an encoded message to an owned byte buffer.
 #pragma once
 

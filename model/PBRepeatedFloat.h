@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The storage of a repeated float field: a growable array of floats, held as
 // element array, count and capacity. The array is the list's own, or room
 // that a decoder lent it inside an array its message keeps alive (see

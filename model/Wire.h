@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Encoding helpers shared by the reader, the writer and the field tables.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The handler's shell and the battery's identity: chem ID and the serial-number
 // suffix, read afresh from the battery driver's "BatteryData" at every call.
 #include <array>

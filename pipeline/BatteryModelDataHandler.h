@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The process-wide object that carries the battery-model pipeline: battery
 // identity, device type, model file, kernel record, upload and verification.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // What each of the daemon's process-wide objects holds: the defaults of the
 // daemon's suite and a log of its own category, and the one shared instance.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Device type: the family whose battery models apply, from the chem-ID table,
 // else the hardware target type the kernel reports.
 #include <algorithm>

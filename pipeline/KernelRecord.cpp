@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Building the kernel record from a decoded model: straight copies of the
 // first elements of every list. A model that cannot fill the record is refused
 // rather than padded, so no byte of the record is made up.

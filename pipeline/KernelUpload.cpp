@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Upload of the record to the kernel driver's "setBatteryParams" method and
 // its confirmation against the hash the driver publishes.
 #include <algorithm>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The battery model as the kernel driver takes it: one flat little-endian
 // record of 29056 bytes, with no header, no padding and no gaps, so every byte
 // is written when it is built.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "pipeline/KextBatteryModelSources.h"
 
 #include "model/OTAParamRC.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Where each list of the record comes from in the model: one table shared by
 // the record builder and by the tools that check a model against the record.
 #pragma once

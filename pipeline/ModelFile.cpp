@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Locating the model file for the battery and decoding its first message.
 #include <cstdio>
 #include <string_view>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "pipeline/PBStreamReader.h"
 
 #include "platform/FileManager.h"

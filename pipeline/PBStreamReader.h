@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Reads a model file: a sequence of messages, each preceded by its length as a
 // varint (the framing of writeDelimitedTo / parseDelimitedFrom, so any protocol
 // buffer toolchain can write one).

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Writes a model file: each message preceded by its length as a varint, the
 // framing PBStreamReader reads.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The disk-to-kernel transfer: the four stages in order, stopping at the first
 // that fails. Each stage's result lives until this method returns.
 #include "model/OTAParamRC.h"

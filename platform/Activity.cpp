@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "platform/Activity.h"
 
 #include <memory>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Scheduled activities in the manner of XPC activities registered with
 // XPC_ACTIVITY_CHECK_IN: the criteria live in the launch configuration (the
 // systemd timer pokes the daemon with SIGUSR1). Registration calls the handler

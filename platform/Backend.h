@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The seam between the platform operations and the system behind them: the
 // Linux host, or the simulated device named by KOLVRAND_DEVICE. Tests install
 // fakes with setBackend().

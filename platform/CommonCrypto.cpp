@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // libcrypto's SHA-1 context functions rather than its EVP interface: the same
 // digest code, without loading the provider machinery, which would more than
 // double the daemon's resident memory for one hash per boot. They are

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // SHA-1 in the manner of CC_SHA1_Init/Update/Final, over OpenSSL's libcrypto.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "platform/Defaults.h"
 
 #include <fcntl.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Persistent settings in the manner of NSUserDefaults with a suite name. A
 // suite is one JSON object in STATE/SUITE.json; every defaults object of one
 // suite in a process sees the same values. Every set is durable before it

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "platform/Dispatch.h"
 
 #include <pthread.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Work queues in the manner of libdispatch: a serial queue with one worker
 // thread, a once-only guard, and the main loop that dispatch_main stands for.
 #pragma once

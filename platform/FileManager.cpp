@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "platform/FileManager.h"
 
 #include <fcntl.h>

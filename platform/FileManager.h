@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The file manager's system Library directory and file existence test.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The I/O registry and user clients in the manner of IOKit: the first service
 // that matches a class name, a property copied as a new owned value, a
 // connection opened with a return code, a structure method called with an

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "platform/Internal.h"
 
 #include <fcntl.h>

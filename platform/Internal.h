@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Helpers shared by the platform sources; not part of the platform's interface.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The registry on Linux: driver services are devices in sysfs, their
 // properties the devices' attribute files, and a user client the
 // power-management driver's character device. The files and the node are

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The registry of the Linux host: the drivers' devices in sysfs and the
 // power-management driver's character device.
 #pragma once

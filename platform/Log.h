@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Leveled logging in the manner of os_log: one named log per subsystem and
 // category, printf-style formats in which %@ prints an object's description
 // (a nil object as "(null)"). A message is formatted only when its level is

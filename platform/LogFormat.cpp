@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // printf-style formatting with %@ for objects.
 #include "platform/Log.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Which levels are enabled, per category, from KOLVRAND_LOG_LEVEL or setLogLevelSpec.
 #include "platform/Log.h"
 

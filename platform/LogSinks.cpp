@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Where messages go: journald when stderr is the journal, else one line each on stderr.
 #include "platform/Log.h"
 

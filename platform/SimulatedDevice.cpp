@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // A device described by the files of one directory, for development and
 // tests on machines without the battery and power-management drivers:
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Kernel variables in the manner of sysctlbyname, with its two-call protocol:
 // a size query (oldp null) sets *oldlenp to the value's size; a second call
 // with a buffer of at least that size copies the value and sets *oldlenp to

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Strings made from bytes in the manner of stringWithUTF8String: nil unless
 // the bytes are well-formed UTF-8 (no overlong forms, no surrogates, nothing
 // above U+10FFFF).

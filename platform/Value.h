@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The one value type of registry properties and of the messages' dictionary
 // form: dictionary, array, number, string, data or boolean.
 #pragma once

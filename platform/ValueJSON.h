@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Values in the JSON of device files: numbers, strings, booleans, arrays and
 // objects map onto themselves (objects keep their order); byte strings are
 // written as {"$data": "HEX"}. JSON null has no Value and is an error.

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: MIT
 # Cross-building for a Debian architecture: the compilers of Debian's
 # g++-TRIPLET package, a sysroot of that architecture's own Debian packages
 # (libc, libcrypto, libsystemd, GoogleTest, ...; ./scripts/cross makes it) and

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: MIT
 # Debian arm64 (see Toolchain.cmake beside this file).
 set(KOLVRAND_CROSS_ARCH arm64)
 set(KOLVRAND_CROSS_TRIPLET aarch64-linux-gnu)

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: MIT
 # Debian armhf (see Toolchain.cmake beside this file).
 set(KOLVRAND_CROSS_ARCH armhf)
 set(KOLVRAND_CROSS_TRIPLET arm-linux-gnueabihf)

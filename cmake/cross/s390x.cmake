@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: MIT
 # Debian s390x (see Toolchain.cmake beside this file).
 set(KOLVRAND_CROSS_ARCH s390x)
 set(KOLVRAND_CROSS_TRIPLET s390x-linux-gnu)

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The real daemon, run on simulated devices holding the example models: what
 // it prints on stderr, what it stores, and how it ends.
 #include <gtest/gtest.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The daemon's two handlers on simulated devices, where its own runs do not
 // go: each state of the battery-aging activity with each value of
 // "updateConditionMet", and the battery-model task without a handler or

@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: MIT
 # Lints each manual page with both formatters a reader may meet: mandoc at
 # its warning level, and groff through man-db (as lintian runs it). Any
 # message fails.

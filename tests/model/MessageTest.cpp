@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Messages as values: copying, merging, equality and hashing, enum names, and
 // where decoded lists live. (Encoding, decoding and the dictionary form are
 // checked against libprotobuf in the oracle test.)

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Random models against libprotobuf, built from the same schema: what it
 // encodes (unpacked or packed) we decode to the same values, and we encode
 // them to its very bytes (so it parses ours back to the same values). And

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Helpers of the model tests: byte strings written as hex text, decoding, and
 // lists as vectors.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Decoding of valid, unusual and broken input, seen through what the message
 // encodes afterwards; the cases are in wire_cases.txt beside this file.
 #include <gtest/gtest.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The committed example models, written on a little-endian 64-bit host, read
 // the same on every target: each decodes and encodes again to the very bytes
 // of its file, and gives the kernel record whose SHA-1 is fixed below. The

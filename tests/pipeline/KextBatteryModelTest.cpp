@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The kernel record, checked against a layout computed here from the field
 // sizes alone: every element of every list lands at its own offset, and
 // nothing but the model decides a byte.

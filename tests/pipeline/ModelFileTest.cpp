@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Which model file the battery gets and how it is read: the battery's identity
 // from the battery driver's registry data, the device type, the path rules and
 // the stream reader's refusals.

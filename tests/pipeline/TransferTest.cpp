@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The whole transfer on simulated devices, through the boot-session gate: for
 // each way it can fail, the exact chain of lines (innermost first), what the
 // driver holds afterwards and that "savedBootUUID" is untouched.

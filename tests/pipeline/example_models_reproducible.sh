@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: MIT
 # The example model files are exactly what the generator makes.
 #   example_models_reproducible.sh GENERATOR SOURCE_DIR
 set -eu

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The simulated device; the kernel-variable, registry, driver and hashing
 // operations that read it; and the defaults kept in its state directory.
 #include <gtest/gtest.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Runs dispatch_main with one activity and reports on stdout, after its pid:
 // "state N" at every call of the activity's handler, and at a run, from a
 // queue of its own, a slow block ("started", then "finished") and one queued

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Serial queues, the main loop's signals and the activity service.
 #include <gtest/gtest.h>
 #include <signal.h>

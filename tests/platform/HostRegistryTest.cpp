@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The host backend against a umockdev testbed that plays the kernel: sysfs
 // devices with the drivers' attribute files, and the power-management
 // driver's node answering the structure-method ioctl. The test starts itself

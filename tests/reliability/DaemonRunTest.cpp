@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The real daemon on temporary copies of examples/device whose settings already
 // hold a boot session of earlier and a value of the aging activity's. Killed
 // at any moment, or asked for activities during the upload, it uploads whole

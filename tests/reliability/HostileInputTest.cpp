@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // One table of hostile inputs, rcmodel's and the daemon's: hostile_inputs.json.
 // Its rows are grouped by the class of input they stand for (the string before
 // a group names the class). Each row says what is put on a fresh copy of the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Writers of one settings suite in other processes and threads: one killed at
 // any moment leaves whole settings, and writers at once lose nothing.
 #include <signal.h>

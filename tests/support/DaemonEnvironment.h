@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The project's programs started on a simulated device: their environment
 // (this process's own, without anything of the daemon's that it may carry)
 // and their start.

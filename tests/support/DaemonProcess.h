@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The real kolvrand binary run on a simulated device, its stderr in a file.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Temporary copies of examples/device for the daemon's runs, whose settings
 // already hold a boot session of earlier and a value of the aging activity's,
 // and one run of the daemon there checked for what every run must hold.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Scratch directories and whole-file reads and writes for the tests.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /* Runs a command and reports what it took: its peak resident set (the
  * largest of it and of everything it waited for) in KiB and its wall-clock
  * time in seconds, so that a test can hold a program to limits of memory and

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Model files made in tests.
 #pragma once
 

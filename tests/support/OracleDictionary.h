@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The dictionary form of a libprotobuf message by the rules of ours: lists
 // always, chemID always (it has no presence in ours), every other field when
 // set. Shared by the oracle test and the differential fuzz target.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // A simulated device in a temporary directory, installed as the platform
 // backend for the test's duration, and a log sink that keeps every message.
 #pragma once

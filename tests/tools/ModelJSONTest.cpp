@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The JSON layer of rcmodel and the dictionary import under it, in process:
 // random models round trip, floats are written shortest and read back exactly,
 // and wrong JSON is refused with the path of the first wrong value.

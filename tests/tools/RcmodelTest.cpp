@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The rcmodel binary as scripts drive it: round trips through JSON, exit codes
 // and what stderr says, where outputs go, validate and plot, and status and
 // record against what the daemon does on a simulated device.

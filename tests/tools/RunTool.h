@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Runs the real rcmodel binary: arguments, standard input and environment in,
 // exit status, standard output and standard error out.
 #pragma once

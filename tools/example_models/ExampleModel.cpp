@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "tools/example_models/ExampleModel.h"
 
 #include <cmath>

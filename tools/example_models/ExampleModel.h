@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Synthetic but plausible battery models, made reproducibly from a chem ID:
 // the same chem ID gives the same bytes on every machine.
 #pragma once

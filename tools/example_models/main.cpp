@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Writes the example model files: one per device type of the chem-ID table
 // (chem ID 5640 in its "a" and "b" variants, two different cells) under
 // OUT/models, and the one the example device loads under OUT/device/Library.

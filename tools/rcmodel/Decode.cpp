@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // rcmodel decode: a model file as JSON, one message per line.
 #include <algorithm>
 #include <cstdio>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // rcmodel encode: JSON back into a model file.
 #include <cstdio>
 #include <span>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The dictionary form of the model messages as JSON, both ways. Output: keys
 // in the message's field order, floats as the shortest decimal that reads back
 // to the same 32-bit float, NaN and the infinities as the strings "NaN",

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Writing a command's output file. A regular file is replaced whole, through a
 // temporary file renamed over it, so a failed write leaves the old content;
 // a symlink is written through, the file it ends at replaced beside itself;

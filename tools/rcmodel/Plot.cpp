@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // rcmodel plot: a model drawn as an SVG picture: the OCV grid, then one panel
 // per resistance table of the record with its values at 25 °C and its
 // temperature coefficients.

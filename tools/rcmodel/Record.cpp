@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // rcmodel record: the record the daemon would send for a model file.
 #include <cstdio>
 

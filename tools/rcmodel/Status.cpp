@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // rcmodel status: what the daemon on this device would load and whether the
 // driver holds it. Read-only: it reads what the daemon reads, through the
 // daemon's own code, and never uploads or writes a setting.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "tools/rcmodel/Tool.h"
 
 #include <fcntl.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // What the commands of rcmodel share: arguments, input and output, messages.
 #pragma once
 

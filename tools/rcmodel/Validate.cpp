@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // rcmodel validate: whether the daemon would load each model file, and why not.
 #include <cstdio>
 #include <span>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "tools/rcmodel/WireCheck.h"
 
 #include <utility>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Where the daemon's reader and the standard protocol-buffer parser part ways.
 // The daemon reads leniently: a known field by its kind whatever wire type it
 // carries, an end-group tag as the end of the message, field number 0 and

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // rcmodel: for the people who write, ship and debug battery models. Decodes
 // and encodes model files, builds the record the daemon would upload, checks
 // a model against that record, draws it, and tells what the daemon on this
