@@ -82,15 +82,15 @@ std::string varint(uint64_t n) {
   return out + static_cast<char>(n);
 }
 
-// The example model as `spec` asks for it.
-std::string exampleModel(const Row& spec) {
-  const std::string how = spec["example"];
+// The example model as `what` asks for it.
+std::string exampleModel(const Row& what) {
+  const std::string how = what["example"];
   std::string bytes = kExample;
-  if (spec.contains("hex")) {
+  if (what.contains("hex")) {
     // The first message's length is one varint; its body grows by the bytes.
     size_t at = 0;
     while (static_cast<uint8_t>(bytes[at]) & 0x80) ++at;
-    const std::string body = bytes.substr(at + 1) + fromHex(spec["hex"]);
+    const std::string body = bytes.substr(at + 1) + fromHex(what["hex"]);
     bytes = varint(body.size()) + body;
   }
   if (how == "half") return bytes.substr(0, bytes.size() / 2);
@@ -106,39 +106,39 @@ std::string nestedGroups(size_t depth) {
   return varint(body.size()) + body;
 }
 
-// Puts what `spec` says at `path`; the descriptors of the locks it takes are
+// Puts at `path` what `what` says; the descriptors of the locks it takes are
 // added to *locks.
-void give(const fs::path& path, const Row& spec, std::vector<int>* locks) {
+void give(const fs::path& path, const Row& what, std::vector<int>* locks) {
   std::error_code ec;
   fs::create_directories(path.parent_path(), ec);
-  if (spec.is_string()) return writeFile(path, spec.get<std::string>());
-  if (spec.contains("merge")) {
+  if (what.is_string()) return writeFile(path, what.get<std::string>());
+  if (what.contains("merge")) {
     json j = json::parse(readFile(path));
-    j.merge_patch(json::parse(spec["merge"].dump()));
+    j.merge_patch(json::parse(what["merge"].dump()));
     return writeFile(path, j.dump());
   }
-  if (spec.contains("fifo") || spec.contains("link") || spec.contains("dir") ||
-      spec.contains("remove"))
+  if (what.contains("fifo") || what.contains("link") || what.contains("dir") ||
+      what.contains("remove"))
     fs::remove_all(path, ec);
-  if (spec.contains("fifo")) {
+  if (what.contains("fifo")) {
     ASSERT_EQ(mkfifo(path.c_str(), 0644), 0);
   }
-  if (spec.contains("link")) fs::create_symlink(spec["link"].get<std::string>(), path);
-  if (spec.contains("dir")) fs::create_directory(path);
-  if (spec.contains("locked")) {
+  if (what.contains("link")) fs::create_symlink(what["link"].get<std::string>(), path);
+  if (what.contains("dir")) fs::create_directory(path);
+  if (what.contains("locked")) {
     const int fd = ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
     ASSERT_TRUE(fd >= 0 && ::flock(fd, LOCK_EX) == 0);
     locks->push_back(fd);
   }
-  if (spec.contains("example")) writeFile(path, exampleModel(spec));
-  if (spec.contains("groups")) writeFile(path, nestedGroups(spec["groups"]));
-  if (spec.contains("zeros")) writeFile(path, std::string(spec["zeros"].get<size_t>(), '\0'));
-  if (spec.contains("repeat")) {
+  if (what.contains("example")) writeFile(path, exampleModel(what));
+  if (what.contains("groups")) writeFile(path, nestedGroups(what["groups"]));
+  if (what.contains("zeros")) writeFile(path, std::string(what["zeros"].get<size_t>(), '\0'));
+  if (what.contains("repeat")) {
     std::string text;
-    for (size_t i = 0; i < spec["times"].get<size_t>(); ++i) text += spec["repeat"];
+    for (size_t i = 0; i < what["times"].get<size_t>(); ++i) text += what["repeat"];
     writeFile(path, text);
   }
-  if (spec.contains("hex") && !spec.contains("example")) writeFile(path, fromHex(spec["hex"]));
+  if (what.contains("hex") && !what.contains("example")) writeFile(path, fromHex(what["hex"]));
 }
 
 // Makes the device usable by nobody, except what is unreadable; the command
@@ -165,9 +165,9 @@ TEST_P(HostileInput, IsRefusedOrBoundedAsItsRowSays) {
   std::vector<int> locks;
   std::vector<fs::path> unreadable;
   const Row given = row.value("given", Row::object());
-  for (const auto& [relative, spec] : given.items()) {
-    give(device.path(relative), spec, &locks);
-    if (spec.is_object() && spec.contains("unreadable"))
+  for (const auto& [relative, what] : given.items()) {
+    give(device.path(relative), what, &locks);
+    if (what.is_object() && what.contains("unreadable"))
       unreadable.push_back(device.path(relative));
   }
   if (HasFatalFailure()) return;
