@@ -78,6 +78,21 @@ std::optional<std::string> syspathOf(sd_device* device) {
   return std::string(path);
 }
 
+// Whether the device's KOLVRAND_SERVICE property is the class name, whole.
+bool namedFor(sd_device* device, std::string_view className) {
+  const char* value = nullptr;
+  return sd_device_get_property_value(device, kServiceProperty, &value) >= 0 && value &&
+         className == value;
+}
+
+// Whether the device's parent is bound to a driver of the class's name.
+bool drivenBy(sd_device* device, std::string_view className) {
+  sd_device* parent = nullptr;
+  const char* driver = nullptr;
+  return sd_device_get_parent(device, &parent) >= 0 && sd_device_get_driver(parent, &driver) >= 0 &&
+         driver && className == driver;
+}
+
 std::optional<std::string> findByProperty(std::string_view className) {
   EnumeratorPtr e = enumerator();
   if (!e || sd_device_enumerator_add_match_property(e.get(), kServiceProperty,
@@ -86,10 +101,7 @@ std::optional<std::string> findByProperty(std::string_view className) {
   for (sd_device* d = sd_device_enumerator_get_device_first(e.get()); d;
        d = sd_device_enumerator_get_device_next(e.get())) {
     // The match is on a glob; the class name must be the whole value.
-    const char* value = nullptr;
-    if (sd_device_get_property_value(d, kServiceProperty, &value) >= 0 && value &&
-        className == value)
-      return syspathOf(d);
+    if (namedFor(d, className)) return syspathOf(d);
   }
   return std::nullopt;
 }
@@ -105,13 +117,8 @@ std::optional<std::string> findByDriver(std::string_view className) {
        sd_device_enumerator_add_match_sysattr(e.get(), devices->attribute, devices->value, 1) < 0))
     return std::nullopt;
   for (sd_device* d = sd_device_enumerator_get_device_first(e.get()); d;
-       d = sd_device_enumerator_get_device_next(e.get())) {
-    sd_device* parent = nullptr;
-    const char* driver = nullptr;
-    if (sd_device_get_parent(d, &parent) >= 0 && sd_device_get_driver(parent, &driver) >= 0 &&
-        driver && className == driver)
-      return syspathOf(d);
-  }
+       d = sd_device_enumerator_get_device_next(e.get()))
+    if (drivenBy(d, className)) return syspathOf(d);
   return std::nullopt;
 }
 
@@ -163,15 +170,29 @@ Value kvrVector(sd_device* device) {
 
 class LinuxRegistry final : public Registry {
  public:
+  // A scan reads the properties of every device in sysfs, and one upload
+  // looks each class up several times: the device found is kept, and at the
+  // next lookup only it is checked again, the scan repeated when it is gone
+  // or no longer stands for the class. Its values are still read afresh.
   uint32_t findService(std::string_view className) override {
+    if (const uint32_t kept = keptService(className)) return kept;
+    bool byProperty = true;
     std::optional<std::string> path = findByProperty(className);
-    if (!path) path = findByDriver(className);
+    if (!path) {
+      byProperty = false;
+      path = findByDriver(className);
+    }
     if (!path) return 0;
     std::lock_guard lock(mutex_);
-    for (size_t i = 0; i < services_.size(); ++i)
-      if (services_[i] == *path) return static_cast<uint32_t>(i + 1);
-    services_.push_back(*path);
-    return static_cast<uint32_t>(services_.size());
+    uint32_t handle = 0;
+    for (size_t i = 0; i < services_.size() && !handle; ++i)
+      if (services_[i] == *path) handle = static_cast<uint32_t>(i + 1);
+    if (!handle) {
+      services_.push_back(*path);
+      handle = static_cast<uint32_t>(services_.size());
+    }
+    found_[std::string(className)] = {handle, byProperty};
+    return handle;
   }
 
   std::optional<Value> property(uint32_t service, std::string_view key) override {
@@ -244,6 +265,21 @@ class LinuxRegistry final : public Registry {
     return DevicePtr(device);
   }
 
+  uint32_t keptService(std::string_view className) {
+    Found found;
+    {
+      std::lock_guard lock(mutex_);
+      auto it = found_.find(className);
+      if (it == found_.end()) return 0;
+      found = it->second;
+    }
+    DevicePtr device = deviceOf(found.service);
+    if (!device) return 0;
+    const bool stands =
+        found.byProperty ? namedFor(device.get(), className) : drivenBy(device.get(), className);
+    return stands ? found.service : 0;
+  }
+
   int connectionFd(uint32_t connection) {
     std::lock_guard lock(mutex_);
     auto it = connections_.find(connection);
@@ -252,6 +288,11 @@ class LinuxRegistry final : public Registry {
 
   std::mutex mutex_;
   std::vector<std::string> services_;  // syspaths; a handle is a position from 1
+  struct Found {
+    uint32_t service = 0;
+    bool byProperty = false;  // else by the driver's name
+  };
+  std::map<std::string, Found, std::less<>> found_;  // by class name
   std::map<uint32_t, int> connections_;
   uint32_t nextConnection_ = 1;
 };
