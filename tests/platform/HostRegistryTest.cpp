@@ -73,22 +73,18 @@ class Testbed {
   // gives them in uevent, and its node in /dev when `node` says so.
   std::string add(const char* driver, const char* subsystem, const char* child,
                   const char* property = nullptr, bool node = false) {
-    gchar* parent =
-        umockdev_testbed_add_device(bed_, "platform", driver, nullptr, nullptr, nullptr);
+    const std::string parent = device("platform", driver, nullptr, {}, {});
     fs::create_directories(root_ / "sys/bus/platform/drivers" / driver);
     fs::create_directory_symlink(fs::path("../../bus/platform/drivers") / driver,
                                  root_ / fs::path(parent).relative_path() / "driver");
     const bool misc = std::strcmp(subsystem, "misc") == 0;
-    gchar* dev = misc ? umockdev_testbed_add_device(
-                            bed_, subsystem, child, parent, "dev", "10:120\n", nullptr, "MAJOR",
-                            "10", "MINOR", "120", "DEVNAME", child,
-                            property ? "KOLVRAND_SERVICE" : nullptr, property, nullptr)
-                      : umockdev_testbed_add_device(bed_, subsystem, child, parent, nullptr,
-                                                    property ? "KOLVRAND_SERVICE" : nullptr,
-                                                    property, nullptr);
-    std::string path = dev;
-    g_free(parent);
-    g_free(dev);
+    std::vector<const char*> attributes, properties;
+    if (misc) {
+      attributes = {"dev", "10:120\n"};
+      properties = {"MAJOR", "10", "MINOR", "120", "DEVNAME", child};
+    }
+    if (property) properties.insert(properties.end(), {"KOLVRAND_SERVICE", property});
+    const std::string path = device(subsystem, child, parent.c_str(), attributes, properties);
     if (node) {
       fs::create_directories(root_ / "dev");
       std::ofstream(root_ / "dev" / child);
@@ -96,14 +92,9 @@ class Testbed {
     return path;
   }
 
-  // A device beside `device`, below the same parent, in `subsystem`.
-  std::string addBeside(const std::string& device, const char* subsystem, const char* name) {
-    const std::string parent = fs::path(device).parent_path().string();
-    gchar* dev =
-        umockdev_testbed_add_device(bed_, subsystem, name, parent.c_str(), nullptr, nullptr);
-    std::string path = dev;
-    g_free(dev);
-    return path;
+  // A device beside `sibling`, below the same parent, in `subsystem`.
+  std::string addBeside(const std::string& sibling, const char* subsystem, const char* name) {
+    return device(subsystem, name, fs::path(sibling).parent_path().c_str(), {}, {});
   }
 
   void attribute(const std::string& device, const char* name, const std::string& value) {
@@ -119,6 +110,18 @@ class Testbed {
   }
 
  private:
+  std::string device(const char* subsystem, const char* name, const char* parent,
+                     std::vector<const char*> attributes, std::vector<const char*> properties) {
+    attributes.push_back(nullptr);
+    properties.push_back(nullptr);
+    gchar* path = umockdev_testbed_add_devicev(bed_, subsystem, name, parent,
+                                               const_cast<gchar**>(attributes.data()),
+                                               const_cast<gchar**>(properties.data()));
+    std::string out = path;
+    g_free(path);
+    return out;
+  }
+
   UMockdevTestbed* bed_;
   fs::path root_;
   UMockdevIoctlBase* ioctl_ = nullptr;
