@@ -5,6 +5,10 @@
 
 KOLVRAND_ROOT=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
 
+# Downloads and builds worth keeping across checkouts (Debian's kernels, the
+# roots debootstrap makes): outside the work tree, so a fresh clone reuses them.
+KOLVRAND_CACHE=${KOLVRAND_CACHE:-${XDG_CACHE_HOME:-$HOME/.cache}/kolvrand}
+
 # Debian packages the build and the tests need.
 KOLVRAND_PACKAGES=(cmake ninja-build g++ clang pkg-config libssl-dev nlohmann-json3-dev libumockdev-dev
   libsystemd-dev libgtest-dev libgmock-dev protobuf-compiler libprotobuf-dev mandoc man-db
@@ -19,8 +23,10 @@ install_missing() {
   echo "Installing: ${missing[*]}"
   local sudo=""
   [ "$(id -u)" -ne 0 ] && sudo="sudo"
-  $sudo apt-get update -qq
-  DEBIAN_FRONTEND=noninteractive $sudo apt-get install -y -qq --no-install-recommends "${missing[@]}"
+  # Another script may be installing at the same moment: wait for its lock.
+  $sudo apt-get -o DPkg::Lock::Timeout=600 update -qq
+  DEBIAN_FRONTEND=noninteractive $sudo apt-get -o DPkg::Lock::Timeout=600 install -y -qq \
+    --no-install-recommends "${missing[@]}"
 }
 
 # build DIR [cmake options...]: configure once, then build everything.
