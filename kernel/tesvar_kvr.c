@@ -34,6 +34,8 @@
 #include <linux/uaccess.h>
 #include <crypto/hash.h>
 
+#include "tesvar_compat.h"
+
 #define TESVAR_KVR_NAME		"TesvarKVR"
 #define TESVAR_KVR_NODE		"tesvar_kvr"
 
@@ -93,8 +95,8 @@ static DEVICE_ATTR_RO(uploads);
  * itself by what is kept.
  */
 static ssize_t battery_params_read(struct file *file, struct kobject *kobj,
-				   struct bin_attribute *attr, char *buf,
-				   loff_t off, size_t count)
+				   tesvar_bin_attr_const struct bin_attribute *attr,
+				   char *buf, loff_t off, size_t count)
 {
 	struct tesvar_kvr *kvr = dev_to_kvr(kobj_to_dev(kobj));
 	ssize_t ret;
@@ -114,7 +116,8 @@ static struct attribute *battery_model_attrs[] = {
 	NULL
 };
 
-static struct bin_attribute *battery_model_bin_attrs[] = {
+static tesvar_bin_attr_const struct bin_attribute *tesvar_bin_attr_const
+battery_model_bin_attrs[] = {
 	&bin_attr_battery_params,
 	NULL
 };
@@ -209,7 +212,7 @@ static const struct file_operations tesvar_kvr_fops = {
 	.open = tesvar_kvr_open,
 	.unlocked_ioctl = tesvar_kvr_ioctl,
 	.compat_ioctl = compat_ptr_ioctl,
-	.llseek = no_llseek,
+	/* No llseek: nonseekable_open() makes every seek fail with ESPIPE. */
 };
 
 static void tesvar_kvr_free_sha1(void *data)
