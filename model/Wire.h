@@ -59,16 +59,6 @@ inline void storeFloat(uint8_t* p, float value) {
   std::memcpy(p, &bits, sizeof bits);
 }
 
-// `count` floats stored little-endian at `p`, which must hold 4 * count
-// readable bytes, into `out`.
-inline void loadFloats(float* out, const uint8_t* p, size_t count) {
-  if constexpr (std::endian::native == std::endian::little) {
-    if (count) std::memcpy(out, p, count * sizeof(float));
-  } else {
-    for (size_t i = 0; i < count; ++i) out[i] = loadFloat(p + 4 * i);
-  }
-}
-
 // `count` floats stored little-endian at `p`, which must have room for
 // 4 * count bytes.
 inline void storeFloats(uint8_t* p, const float* values, size_t count) {

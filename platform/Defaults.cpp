@@ -12,14 +12,12 @@
 #include <map>
 #include <mutex>
 
+#include "base/ValueJSON.h"
 #include "platform/Backend.h"
 #include "platform/FileManager.h"
 #include "platform/Internal.h"
-#include "platform/ValueJSON.h"
 
 namespace kolvrand {
-
-using platform::JSON;
 
 struct NSUserDefaults::Suite {
   std::filesystem::path path;      // STATE/SUITE.json

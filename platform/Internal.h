@@ -33,7 +33,4 @@ std::optional<std::string> readFile(const std::filesystem::path& path, int* err 
 bool writeFileAtomically(const std::filesystem::path& path, std::string_view bytes,
                          std::string* error);
 
-// Even-length hexadecimal text of either case; nullopt on anything else.
-std::optional<std::string> fromHex(std::string_view hex);
-
 }  // namespace kolvrand::platform

@@ -13,7 +13,7 @@
 #include <cstdlib>
 #include <mutex>
 
-#include "platform/Utf8.h"
+#include "base/Utf8.h"
 
 namespace kolvrand {
 

@@ -13,12 +13,12 @@
 #include <set>
 #include <vector>
 
+#include "base/CommonCrypto.h"
+#include "base/ValueJSON.h"
 #include "platform/Backend.h"
-#include "platform/CommonCrypto.h"
 #include "platform/FileManager.h"
 #include "platform/IOKit.h"
 #include "platform/Internal.h"
-#include "platform/ValueJSON.h"
 
 namespace kolvrand::platform {
 

@@ -7,8 +7,8 @@
 #include <set>
 #include <thread>
 
+#include "base/Value.h"
 #include "platform/Log.h"
-#include "platform/Value.h"
 #include "tests/support/TestDevice.h"
 
 namespace kolvrand {

@@ -9,10 +9,10 @@
 #include <regex>
 #include <thread>
 
+#include "base/CommonCrypto.h"
 #include "daemon/BatteryModelTask.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/DaemonIdentifier.h"
-#include "platform/CommonCrypto.h"
 #include "tests/support/ModelFiles.h"
 #include "tests/support/TestDevice.h"
 #include "tests/tools/RunTool.h"

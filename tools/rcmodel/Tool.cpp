@@ -12,11 +12,11 @@
 #include <filesystem>
 #include <span>
 
+#include "base/Utf8.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/PBStreamReader.h"
 #include "platform/FileManager.h"
 #include "platform/Log.h"
-#include "platform/Utf8.h"
 
 namespace kolvrand::rcmodel {
 

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: MIT
 // printf-style formatting with %@ for objects.
-#include "platform/Log.h"
+#include "base/Format.h"
 
 #include <cinttypes>
 #include <cmath>
