@@ -69,11 +69,12 @@ LogArg makeLogArg(const T& a) {
   }
 }
 
-// Formats `format` with printf semantics for the conversions d i u x X o c s p
-// f e g %, with the length modifiers hh h l ll j z t, flags, width and
-// precision; %@ prints an object (or a string) and "(null)" for nil; %s of a
-// null C string prints "(null)". A conversion without a matching argument
-// prints nothing; surplus arguments are ignored.
+// Formats `format` as printf would for the conversions d i u x X o c s p f F
+// e E g G a A %, with flags, width, precision and the length modifiers hh h l
+// ll j z t; %@ prints an object (or a string), and "(null)" for nil, as %s
+// does for a null C string. A directive without its argument prints nothing,
+// surplus arguments are ignored, and a directive of another conversion, or
+// with a width or precision above 4096, prints as it stands.
 std::string formatLogMessage(std::string_view format, std::span<const LogArg> args);
 
 }  // namespace kolvrand
