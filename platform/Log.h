@@ -12,10 +12,9 @@
 #include <string_view>
 
 #include "base/Format.h"
+#include "base/LogLevels.h"
 
 namespace kolvrand {
-
-enum class LogLevel : uint8_t { Error = 0, Default = 1, Debug = 2 };
 
 // Where formatted messages go. The default sink is chosen once per process:
 // journald when stderr is the journal, else one line per message on stderr.
