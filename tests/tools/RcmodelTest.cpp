@@ -231,11 +231,14 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
 
   // Before the daemon ran: nothing saved, nothing published, and status
   // creates neither the state directory nor the driver's record.
-  EXPECT_EQ(verdict(), "stale") << report;
+  EXPECT_EQ(verdict(), "empty") << report;
   const std::string record = field("record SHA-1");
+  EXPECT_EQ(field("power-management driver"), "found, holds no record");
+  EXPECT_EQ(field("chem ID"), "0x2168 (8552), the battery reports 0x1927 (6439)");
   EXPECT_EQ(field("saved boot session"), "(none)");
   EXPECT_EQ(field("model file"), model.string());
   EXPECT_EQ(field("driver's hash"), "(none published)");
+  EXPECT_EQ(field("next step"), "rcmodel upload");
   EXPECT_FALSE(fs::exists(device.dir() / "state") || fs::exists(device.dir() / "driver"));
 
   runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
@@ -248,8 +251,15 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
   const std::string state = readFile(device.statePath());
   EXPECT_EQ(verdict(), "loaded") << report;
   EXPECT_EQ(field("driver's hash"), record);
+  EXPECT_EQ(field("next step"), "");
   EXPECT_EQ(field("saved boot session"),
             "11111111-2222-3333-4444-555555555555 (this boot session)");
+
+  // The driver reloaded since: it holds nothing, whatever the settings say.
+  fs::rename(device.dir() / "driver", device.dir() / "driver.kept");
+  EXPECT_EQ(verdict(), "empty") << report;
+  EXPECT_EQ(field("next step"), "rcmodel upload");
+  fs::rename(device.dir() / "driver.kept", device.dir() / "driver");
 
   // The model file changed after the upload.
   device.installModel("T618e/2168.rcmodel",
@@ -267,6 +277,7 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
   fs::remove(model);
   EXPECT_EQ(verdict(), "missing") << report;
   EXPECT_EQ(field("model file exists"), "no");
+  EXPECT_EQ(field("next step"), "install the model as " + model.string() + ", then rcmodel upload");
   fs::create_directory(model);
   EXPECT_EQ(verdict(), "missing") << report;
   EXPECT_EQ(field("model file exists"), "no, not a regular file");
@@ -283,6 +294,135 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
                       "record carries 303\n"))
       << report;
   EXPECT_EQ(readFile(device.statePath()), state);
+
+  // A driver missing is said before anything else, and no model path is
+  // blamed for it.
+  for (const char* driver : {"TesvarSmartBattery", "TesvarKVR"}) {
+    json["registry"] = test::defaultDeviceJSON()["registry"];
+    json["registry"].erase(driver);
+    device.writeDeviceJSON(json);
+    EXPECT_EQ(verdict(), "no driver") << report;
+    EXPECT_TRUE(matches(report, driver == std::string("TesvarKVR")
+                                    ? "^device: [^\n]*\nbattery driver: +found\npower-management "
+                                      "driver: not found: no device stands for TesvarKVR\n"
+                                    : "^device: [^\n]*\nbattery driver: +not found: no power "
+                                      "supply stands for TesvarSmartBattery\n[\\s\\S]*\nchem ID: "
+                                      "+\\(none: no battery driver; the daemon would use 0\\)"))
+        << report;
+  }
+}
+
+// rcmodel upload: the daemon's own transfer, or the record of a given file,
+// sent to the driver now and verified against the hash it publishes; the
+// daemon's settings are left as they were. Each refusal is one line, and then
+// nothing reaches the driver.
+TEST_F(Rcmodel, UploadSendsTheRecordNowAndLeavesTheSettings) {
+  const std::string settings = R"({"savedBootUUID": "earlier", "savedChemID": 1})";
+  using Change = void (*)(nlohmann::json&);
+  const struct {
+    const char* name;
+    std::vector<std::string> args;
+    Change change;  // of the device
+    int status;
+    std::string out, err;  // what each must match; err "": nothing
+    const char* held;      // the file whose record the driver then holds, if any
+  } rows[] = {
+      {"the daemon's model",
+       {"upload"},
+       nullptr,
+       0,
+       "^device: [^\n]*\nchem ID: +0x2168 \\(8552\\), the battery reports 0x1927 "
+       "\\(6439\\)\ndevice type: +T618e\nmodel file: [^\n]*/T618e/2168.rcmodel\nrecord "
+       "SHA-1: +([0-9a-f]{40})\ndriver's hash: +\\1\nresult: +uploaded and verified\n$",
+       "",
+       "MODEL"},
+      {"a file",
+       {"upload", "good"},
+       nullptr,
+       0,
+       "\nmodel file: +good\nrecord SHA-1: +([0-9a-f]{40})\ndriver's hash: +\\1\n",
+       "",
+       "good"},
+      {"no power-management driver",
+       {"upload"},
+       [](nlohmann::json& j) { j["registry"].erase("TesvarKVR"); },
+       1,
+       "^device: [^\n]*\n$",
+       "^rcmodel upload: the power-management driver is not loaded: [^\n]*\n$",
+       nullptr},
+      {"no battery driver",
+       {"upload"},
+       [](nlohmann::json& j) { j["registry"].erase("TesvarSmartBattery"); },
+       1,
+       "^device: [^\n]*\n$",
+       "^rcmodel upload: the battery driver is not loaded: [^\n]*\n$",
+       nullptr},
+      {"no access to the node",
+       {"upload"},
+       [](nlohmann::json& j) { j["driver"]["openResult"] = 0xe00002c1u; },
+       1,
+       "^device: [^\n]*\n$",
+       "^rcmodel upload: no access to the power-management driver's node: run as root or as a "
+       "member of the group that owns it [^\n]*\n$",
+       nullptr},
+      {"a file that breaks off",
+       {"upload", "cut"},
+       nullptr,
+       1,
+       "^device: [^\n]*\n$",
+       "^rcmodel upload: cut: message 0 [^\n]*\n$",
+       nullptr},
+      {"a model the daemon refuses",
+       {"upload", "short"},
+       nullptr,
+       1,
+       "^device: [^\n]*\n$",
+       "R0 nil[\\s\\S]*short: the daemon would refuse this model",
+       nullptr},
+      {"no model file",
+       {"upload"},
+       nullptr,
+       1,
+       "\nmodel file:|^device",
+       "^rcmodel upload: [^\n]*file not present[^\n]*\nrcmodel upload: no model file for this "
+       "battery: install it as [^\n]*/T618e/2168.rcmodel\n$",
+       nullptr},
+      {"another hash published",
+       {"upload"},
+       [](nlohmann::json& j) {
+         j["registry"]["TesvarKVR"]["KVRVector"] = {
+             {"KVRBatteryModel", {{"RCParamsHash", {{"$data", "00"}}}}}};
+       },
+       1,
+       "\ndriver's hash: +00\nresult: +failed\n$",
+       "hash verify failed\n[\\s\\S]*the driver does not hold this record",
+       "MODEL"},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.name);
+    auto json = test::defaultDeviceJSON();
+    if (row.change) row.change(json);
+    test::TestDevice device(json);
+    if (std::string(row.name) != "no model file")
+      device.installModel("T618e/2168.rcmodel", exampleFile([](OTAParamRC& m) { m.setChemID(1); }));
+    writeFile(device.statePath(), settings);
+    ToolRun run = s.rcmodel(row.args, "", device.dir().string());
+    EXPECT_EQ(run.status, row.status);
+    EXPECT_TRUE(row.err.empty() ? run.err.empty() : matches(run.err, row.err)) << run.err;
+    EXPECT_TRUE(matches(run.out, row.out)) << run.out;
+    const fs::path sent = device.dir() / "driver/battery_params.bin";
+    EXPECT_EQ(fs::exists(sent), row.held != nullptr);
+    if (row.held) {
+      const std::string file =
+          row.held == std::string("MODEL")
+              ? (device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel").string()
+              : row.held;
+      s.rcmodel({"record", file, "-o", "expected.bin"});
+      EXPECT_EQ(readFile(sent), readFile(s / "expected.bin"));
+      fs::remove(s / "expected.bin");
+    }
+    EXPECT_EQ(readFile(device.statePath()), settings);
+  }
 }
 
 }  // namespace
