@@ -1,13 +1,14 @@
 // SPDX-License-Identifier: MIT
 // The daemon's key lines carry the message ID of their entry in the journal
 // catalog the package installs, read here by journalctl's own catalog parser
-// in a root of its own: each line finds the entry that explains it, and no
-// entry is without its line.
+// in a root of its own: each line of message_ids.json finds the entry that
+// explains it, and no entry is without its line.
 #include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <cstdio>
 #include <map>
+#include <nlohmann/json.hpp>
 #include <set>
 
 #include "platform/MessageIDs.h"
@@ -41,41 +42,12 @@ TEST(MessageIDs, KeyLinesFindTheirCatalogEntry) {
   const test::TempDir root;
   const std::map<std::string, std::string> entries = catalog(root);
   ASSERT_FALSE(entries.empty());
-  const std::string handler = "-[BatteryModelDataHandler ";
-  const std::pair<std::string, std::string> rows[] = {
-      {"Battery data upload succeeded\n", "uploaded and verified"},
-      {"Battery data upload failed\n", "upload failed"},
-      {"Main Unchanged boot UUID. Skipping battery model task\n", "uploaded earlier in this boot"},
-      {"Unable to get current boot UUID\n", "boot session cannot be read"},
-      {"Could not allocate defaults\n", "settings cannot be opened"},
-      {"kolvrand failed to start\n", "could not make its objects"},
-      {handler + "getIntValueForKeyFromBatteryData:] <Error> powerService null",
-       "battery driver is not loaded"},
-      {handler + "getSpecialCaseBatteryModelIdentifier:] <Error> powerService null",
-       "battery driver is not loaded"},
-      {handler + "getBatteryModelFileURLString:] <Error> file not present: /x/0.rcmodel",
-       "No model file"},
-      {handler + "moveBatteryModelDataFromDiskToKext:] <Error> protobufModel nil",
-       "model file was refused"},
-      {handler + "moveBatteryModelDataFromDiskToKext:] <Error> kextModel nil",
-       "model file was refused"},
-      {handler + "setBatteryModelDataToKernel:] <Error> no io service get matched",
-       "power-management driver is not loaded"},
-      {handler + "setBatteryModelDataToKernel:] <Error> IOServiceOpen fail to connect, "
-                 "ioReturnResult = -536870207",
-       "node cannot be opened"},
-      {handler + "setBatteryModelDataToKernel:] <Error> IOConnectCallStructMethod fail to call "
-                 "IOUserClient setBatteryParams,  ioReturnResult = -536870206",
-       "refused the record"},
-      {handler + "setBatteryModelDataToKernel:] <Error> hash verify failed", "hash does not match"},
-      // Lines without an entry: the chatter, and the links of a chain whose
-      // innermost line has one.
-      {"Battery data upload run for chemId 0x2168\n", ""},
-      {handler + "moveBatteryModelDataFromDiskToKext:] <Error> file (null) does not exist", ""},
-      {"x Battery data upload succeeded", ""},
-  };
+  const auto rows =
+      nlohmann::json::parse(test::readFile(KOLVRAND_SOURCE_DIR "/tests/platform/message_ids.json"));
   std::set<std::string> used;
-  for (const auto& [line, subject] : rows) {
+  for (const auto& row : rows) {
+    if (row.is_string()) continue;
+    const std::string line = row[0], subject = row[1];
     SCOPED_TRACE(line);
     const std::string id(platform::messageIDFor(line));
     if (subject.empty()) {

@@ -315,111 +315,35 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
 // rcmodel upload: the daemon's own transfer, or the record of a given file,
 // sent to the driver now and verified against the hash it publishes; the
 // daemon's settings are left as they were. Each refusal is one line, and then
-// nothing reaches the driver.
+// nothing reaches the driver. The uses are in rcmodel_uploads.json: the
+// device is the example one with "device" merged into its device.json, its
+// model installed unless "model" is false; "held" names the file whose record
+// the driver then holds (MODEL: the installed one).
 TEST_F(Rcmodel, UploadSendsTheRecordNowAndLeavesTheSettings) {
   const std::string settings = R"({"savedBootUUID": "earlier", "savedChemID": 1})";
-  using Change = void (*)(nlohmann::json&);
-  const struct {
-    const char* name;
-    std::vector<std::string> args;
-    Change change;  // of the device
-    int status;
-    std::string out, err;  // what each must match; err "": nothing
-    const char* held;      // the file whose record the driver then holds, if any
-  } rows[] = {
-      {"the daemon's model",
-       {"upload"},
-       nullptr,
-       0,
-       "^device: [^\n]*\nchem ID: +0x2168 \\(8552\\), the battery reports 0x1927 "
-       "\\(6439\\)\ndevice type: +T618e\nmodel file: [^\n]*/T618e/2168.rcmodel\nrecord "
-       "SHA-1: +([0-9a-f]{40})\ndriver's hash: +\\1\nresult: +uploaded and verified\n$",
-       "",
-       "MODEL"},
-      {"a file",
-       {"upload", "good"},
-       nullptr,
-       0,
-       "\nmodel file: +good\nrecord SHA-1: +([0-9a-f]{40})\ndriver's hash: +\\1\n",
-       "",
-       "good"},
-      {"no power-management driver",
-       {"upload"},
-       [](nlohmann::json& j) { j["registry"].erase("TesvarKVR"); },
-       1,
-       "^device: [^\n]*\n$",
-       "^rcmodel upload: the power-management driver is not loaded: [^\n]*\n$",
-       nullptr},
-      {"no battery driver",
-       {"upload"},
-       [](nlohmann::json& j) { j["registry"].erase("TesvarSmartBattery"); },
-       1,
-       "^device: [^\n]*\n$",
-       "^rcmodel upload: the battery driver is not loaded: [^\n]*\n$",
-       nullptr},
-      {"no access to the node",
-       {"upload"},
-       [](nlohmann::json& j) { j["driver"]["openResult"] = 0xe00002c1u; },
-       1,
-       "^device: [^\n]*\n$",
-       "^rcmodel upload: no access to the power-management driver's node: run as root or as a "
-       "member of the group that owns it [^\n]*\n$",
-       nullptr},
-      {"a file that breaks off",
-       {"upload", "cut"},
-       nullptr,
-       1,
-       "^device: [^\n]*\n$",
-       "^rcmodel upload: cut: message 0 [^\n]*\n$",
-       nullptr},
-      {"a model the daemon refuses",
-       {"upload", "short"},
-       nullptr,
-       1,
-       "^device: [^\n]*\n$",
-       "R0 nil[\\s\\S]*short: the daemon would refuse this model",
-       nullptr},
-      {"no model file",
-       {"upload"},
-       nullptr,
-       1,
-       "\nmodel file:|^device",
-       "^rcmodel upload: [^\n]*file not present[^\n]*\nrcmodel upload: no model file for this "
-       "battery: install it as [^\n]*/T618e/2168.rcmodel\n$",
-       nullptr},
-      {"another hash published",
-       {"upload"},
-       [](nlohmann::json& j) {
-         j["registry"]["TesvarKVR"]["KVRVector"] = {
-             {"KVRBatteryModel", {{"RCParamsHash", {{"$data", "00"}}}}}};
-       },
-       1,
-       "\ndriver's hash: +00\nresult: +failed\n$",
-       "hash verify failed\n[\\s\\S]*the driver does not hold this record",
-       "MODEL"},
-  };
-  for (const auto& row : rows) {
-    SCOPED_TRACE(row.name);
+  const auto uses =
+      nlohmann::json::parse(readFile(KOLVRAND_SOURCE_DIR "/tests/tools/rcmodel_uploads.json"));
+  for (const auto& use : uses) {
+    SCOPED_TRACE(use.dump());
     auto json = test::defaultDeviceJSON();
-    if (row.change) row.change(json);
+    json.merge_patch(use.value("device", nlohmann::json::object()));
     test::TestDevice device(json);
-    if (std::string(row.name) != "no model file")
-      device.installModel("T618e/2168.rcmodel", exampleFile([](OTAParamRC& m) { m.setChemID(1); }));
+    const fs::path model = device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel";
+    // Another model than "good", so that what the driver holds tells them apart.
+    if (use.value("model", true))
+      writeFile(model, exampleFile([](OTAParamRC& m) { m.setChemID(1); }));
     writeFile(device.statePath(), settings);
-    ToolRun run = s.rcmodel(row.args, "", device.dir().string());
-    EXPECT_EQ(run.status, row.status);
-    EXPECT_TRUE(row.err.empty() ? run.err.empty() : matches(run.err, row.err)) << run.err;
-    EXPECT_TRUE(matches(run.out, row.out)) << run.out;
+    ToolRun run = s.rcmodel(use["args"], "", device.dir().string());
+    EXPECT_EQ(run.status, use["status"].get<int>());
+    const std::string err = use.value("err", "");
+    EXPECT_TRUE(err.empty() ? run.err.empty() : matches(run.err, err)) << run.err;
+    EXPECT_TRUE(matches(run.out, use["out"].get<std::string>())) << run.out;
     const fs::path sent = device.dir() / "driver/battery_params.bin";
-    EXPECT_EQ(fs::exists(sent), row.held != nullptr);
-    if (row.held) {
-      const std::string file =
-          row.held == std::string("MODEL")
-              ? (device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel").string()
-              : row.held;
-      s.rcmodel({"record", file, "-o", "expected.bin"});
+    const std::string held = use.value("held", "");
+    EXPECT_EQ(fs::exists(sent), !held.empty());
+    if (!held.empty()) {
+      s.rcmodel({"record", held == "MODEL" ? model.string() : held, "-o", "expected.bin"});
       EXPECT_EQ(readFile(sent), readFile(s / "expected.bin"));
-      fs::remove(s / "expected.bin");
     }
     EXPECT_EQ(readFile(device.statePath()), settings);
   }
