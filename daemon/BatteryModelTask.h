@@ -4,24 +4,26 @@
 // "savedBootUUID" only after a successful upload.
 #pragma once
 
+#include <cstdint>
 #include <optional>
 #include <string>
 
 #include "pipeline/BatteryModelDataHandler.h"
+#include "pipeline/BootSession.h"
 #include "platform/Log.h"
 
 namespace kolvrand {
 
-// The kernel's boot-session UUID, or nullopt when it cannot be read or is not
-// UTF-8.
-std::optional<std::string> currentBootSessionUUID();
-
-// Whether `bootUUID` is the boot session of the last confirmed upload, the
-// one "savedBootUUID" holds: the battery-model task then has nothing to do.
-bool isSavedBootSession(const NSUserDefaults& defaults, const std::string& bootUUID);
+// How the task ended, for the service manager's status line; chemID is the
+// one the upload was tried with.
+struct BatteryModelTaskResult {
+  enum Outcome { Uploaded, Skipped, Failed } outcome;
+  uint32_t chemID = 0;
+};
 
 // Runs once per process start on the battery-model queue. `handler` may be
 // nil: the chem ID is then 0 and the upload reports false.
-void runBatteryModelTask(const os_log_t& mainLog, BatteryModelDataHandler* handler);
+BatteryModelTaskResult runBatteryModelTask(const os_log_t& mainLog,
+                                           BatteryModelDataHandler* handler);
 
 }  // namespace kolvrand

@@ -9,12 +9,15 @@
 #include "daemon/BatteryAgingActivity.h"
 #include "daemon/BatteryModelTask.h"
 #include "daemon/ConditionCheckingAgent.h"
+#include "daemon/ServiceStatus.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "platform/Activity.h"
 #include "platform/Backend.h"
 #include "platform/Dispatch.h"
 #include "platform/Log.h"
+#include "platform/LogTap.h"
+#include "platform/ServiceManager.h"
 
 namespace {
 
@@ -73,13 +76,23 @@ int main(int argc, char** argv) {
   gHandler = BatteryModelDataHandler::sharedInstance();
   if (!gAgent || !gHandler) os_log_error(mainLog, "kolvrand failed to start\n");
 
-  dispatch_async(queue, [mainLog] { runBatteryModelTask(mainLog, gHandler.get()); });
+  // The task's outcome becomes the service's status line (systemctl status).
+  dispatch_async(queue, [mainLog] {
+    const FirstErrorTap tap;
+    const BatteryModelTaskResult result = runBatteryModelTask(mainLog, gHandler.get());
+    platform::notifyServiceManager("STATUS=" +
+                                   batteryModelStatus(result, gHandler.get(), tap.line()));
+  });
 
   const std::string activityName = std::string(DaemonIdentifier) + ".batteryAgingUpdate";
   xpc_activity_register(activityName.c_str(), XPC_ACTIVITY_CHECK_IN,
                         [mainLog](xpc_activity_t activity) {
                           batteryAgingActivityHandler(activity, mainLog, gAgent.get());
                         });
+
+  // Set up: the service manager may count the service as started. The
+  // upload's outcome follows in the status line.
+  platform::notifyServiceManager("READY=1");
 
   dispatch_main();
 }

@@ -15,6 +15,8 @@
 
 #include "base/Utf8.h"
 #include "platform/FileManager.h"
+#include "platform/LogTap.h"
+#include "platform/MessageIDs.h"
 
 namespace kolvrand {
 
@@ -76,6 +78,10 @@ class JournalSink final : public LogSink {
     std::string msg = "MESSAGE=";
     msg.append(withoutTrailingNewline(message));
     static const char identifier[] = "SYSLOG_IDENTIFIER=kolvrand";
+    // The key lines carry the ID of their catalog entry (journalctl -x).
+    const std::string_view messageID = platform::messageIDFor(message);
+    std::string id = "MESSAGE_ID=";
+    id.append(messageID);
     auto iov = [](const void* p, size_t n) { return iovec{const_cast<void*>(p), n}; };
     const iovec fields[] = {
         iov(priority, std::char_traits<char>::length(priority)),
@@ -83,9 +89,10 @@ class JournalSink final : public LogSink {
         iov(sub.data(), sub.size()),
         iov(cat.data(), cat.size()),
         iov(msg.data(), msg.size()),
+        iov(id.data(), id.size()),
     };
-    if (sd_journal_sendv(fields, static_cast<int>(std::size(fields))) < 0)
-      writeStderrLine(level, category, message);
+    const int count = static_cast<int>(std::size(fields)) - (messageID.empty() ? 1 : 0);
+    if (sd_journal_sendv(fields, count) < 0) writeStderrLine(level, category, message);
   }
 };
 
@@ -140,6 +147,7 @@ void setLogSink(std::shared_ptr<LogSink> sink) {
 void emitLog(const OSLog& log, LogLevel level, std::string_view format,
              std::span<const LogArg> args) {
   std::string message = formatLogMessage(format, args);
+  if (level == LogLevel::Error) FirstErrorTap::note(message);
   if (auto sink = currentSink()) sink->write(level, log.subsystem(), log.category(), message);
 }
 

@@ -2,9 +2,14 @@
 // The real daemon, run on simulated devices holding the example models: what
 // it prints on stderr, what it stores, and how it ends.
 #include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 
 #include <algorithm>
 
+#include "base/CommonCrypto.h"
+#include "base/Hex.h"
+#include "base/Value.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/TestDevice.h"
 #include "tests/tools/RunTool.h"
@@ -88,6 +93,83 @@ TEST(Daemon, UploadsOncePerBootSessionServesTheActivityAndStopsCleanly) {
       "error [platform] KOLVRAND_LOG_LEVEL: \"garbage\", \"main=loud\" not understood"));
   EXPECT_EQ(again[1], "default [main] Battery data upload succeeded");
   EXPECT_EQ(device.state()["savedBootUUID"], rebooted["sysctl"]["kern.bootsessionuuid"]);
+}
+
+// A datagram socket of a service manager's, as NOTIFY_SOCKET names one.
+class NotifySocket {
+ public:
+  explicit NotifySocket(const fs::path& path) : path_(path) {
+    fd_ = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path.string().copy(address.sun_path, sizeof address.sun_path - 1);
+    EXPECT_EQ(bind(fd_, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    const timeval timeout{60, 0};
+    setsockopt(fd_, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout);
+  }
+  ~NotifySocket() { close(fd_); }
+  std::string variable() const { return "NOTIFY_SOCKET=" + path_.string(); }
+  // The next datagram; "" when none came within a minute.
+  std::string receive() const {
+    char buffer[4096];
+    const ssize_t n = recv(fd_, buffer, sizeof buffer, 0);
+    return n > 0 ? std::string(buffer, static_cast<size_t>(n)) : "";
+  }
+
+ private:
+  fs::path path_;
+  int fd_ = -1;
+};
+
+// The service manager hears READY=1 once the daemon is set up, and one status
+// line for the battery-model task: what it uploaded, that it skipped, or the
+// innermost line of the failure's chain (the task and the set-up run on
+// threads of their own, so the two come in either order).
+TEST(Daemon, TellsTheServiceManagerItIsReadyAndHowTheUploadEnded) {
+  const struct {
+    const char* name;
+    void (*prepare)(Device&);
+    std::string status;  // DIR stands for the device's directory
+  } rows[] = {
+      {"uploaded", nullptr, "uploaded and verified: chem ID 0x2168, SHA-1 "},
+      {"already uploaded in this boot session",
+       [](Device& d) {
+         test::writeFile(d.statePath(),
+                         json{{"savedBootUUID", "11111111-2222-3333-4444-555555555555"}}.dump());
+       },
+       "skipped: already uploaded in this boot"},
+      {"no model file", [](Device& d) { fs::remove_all(d.models()); },
+       "failed: -[BatteryModelDataHandler getBatteryModelFileURLString:] <Error> file not present: "
+       "DIR/Library/KVR/BatteryModels/T618e/2168.rcmodel"},
+      {"no battery driver",
+       [](Device& d) {
+         json j = test::defaultDeviceJSON();
+         j["registry"].erase("TesvarSmartBattery");
+         d.writeDeviceJSON(j);
+       },
+       "failed: -[BatteryModelDataHandler getIntValueForKeyFromBatteryData:] <Error> powerService "
+       "null"},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.name);
+    Device device;
+    if (row.prepare) row.prepare(device);
+    const NotifySocket manager(device.dir() / "notify");
+    test::DaemonProcess daemon(device.dir(), "error", {}, {}, {manager.variable()});
+    std::vector<std::string> heard = {manager.receive(), manager.receive()};
+    std::sort(heard.begin(), heard.end());
+    std::string status = row.status;
+    if (const size_t at = status.find("DIR"); at != status.npos)
+      status.replace(at, 3, device.dir().string());
+    if (status.ends_with("SHA-1 ")) {
+      const std::string record = test::readFile(device.dir() / "driver/battery_params.bin");
+      const SHA1Digest digest = sha1(record.data(), record.size());
+      status += hexString(digest.data(), digest.size());
+    }
+    EXPECT_EQ(heard, (std::vector<std::string>{"READY=1", "STATUS=" + status}));
+    daemon.signal(SIGTERM);
+    EXPECT_EQ(daemon.waitForExit(), 0) << daemon.rawStderr();
+  }
 }
 
 // Whoever sets the target type must not lead the daemon out of the Library:

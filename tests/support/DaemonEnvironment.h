@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: MIT
 // The project's programs started on a simulated device: their environment
-// (this process's own, without anything of the daemon's that it may carry)
+// (this process's own, without anything of the daemon's that it may carry,
+// nor the service manager's socket of a test run as a service)
 // and their start.
 #pragma once
 
@@ -32,7 +33,7 @@ class DaemonEnvironment {
     for (char** e = environ; *e; ++e) {
       std::string_view v(*e);
       if (!v.starts_with("KOLVRAND_") && !v.starts_with("JOURNAL_STREAM=") &&
-          !v.starts_with("STATE_DIRECTORY=") && !replaced(v))
+          !v.starts_with("STATE_DIRECTORY=") && !v.starts_with("NOTIFY_SOCKET=") && !replaced(v))
         strings_.emplace_back(v);
     }
     strings_.insert(strings_.end(), extra.begin(), extra.end());

@@ -26,9 +26,11 @@ inline std::filesystem::path daemonBinary() {
 class DaemonProcess {
  public:
   // `launcher`, when given, is a command that runs the daemon in its place
-  // (its first word an absolute path), such as setpriv to drop privileges.
+  // (its first word an absolute path), such as setpriv to drop privileges;
+  // `env` holds further "NAME=VALUE" variables.
   DaemonProcess(const std::filesystem::path& device, const std::string& logLevel = "debug",
-                std::vector<std::string> launcher = {}, std::vector<std::string> args = {})
+                std::vector<std::string> launcher = {}, std::vector<std::string> args = {},
+                const std::vector<std::string>& env = {})
       : stderrPath_(device / "daemon.stderr"), stdoutPath_(device / "daemon.stdout") {
     // A previous run's stderr must not be read as this one's: posix_spawn may
     // return before the child has opened the file (it does under qemu-user).
@@ -36,8 +38,8 @@ class DaemonProcess {
     std::filesystem::remove(stdoutPath_);
     launcher.push_back(daemonBinary().string());
     launcher.insert(launcher.end(), args.begin(), args.end());
-    pid_ =
-        spawnProgram(launcher, DaemonEnvironment(device, logLevel), {{}, stdoutPath_, stderrPath_});
+    pid_ = spawnProgram(launcher, DaemonEnvironment(device, logLevel, env),
+                        {{}, stdoutPath_, stderrPath_});
     running_ = pid_ > 0;
   }
   ~DaemonProcess() {

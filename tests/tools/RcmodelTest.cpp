@@ -231,11 +231,14 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
 
   // Before the daemon ran: nothing saved, nothing published, and status
   // creates neither the state directory nor the driver's record.
-  EXPECT_EQ(verdict(), "stale") << report;
+  EXPECT_EQ(verdict(), "empty") << report;
   const std::string record = field("record SHA-1");
+  EXPECT_EQ(field("power-management driver"), "found, holds no record");
+  EXPECT_EQ(field("chem ID"), "0x2168 (8552), the battery reports 0x1927 (6439)");
   EXPECT_EQ(field("saved boot session"), "(none)");
   EXPECT_EQ(field("model file"), model.string());
   EXPECT_EQ(field("driver's hash"), "(none published)");
+  EXPECT_EQ(field("next step"), "rcmodel upload");
   EXPECT_FALSE(fs::exists(device.dir() / "state") || fs::exists(device.dir() / "driver"));
 
   runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
@@ -248,8 +251,15 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
   const std::string state = readFile(device.statePath());
   EXPECT_EQ(verdict(), "loaded") << report;
   EXPECT_EQ(field("driver's hash"), record);
+  EXPECT_EQ(field("next step"), "");
   EXPECT_EQ(field("saved boot session"),
             "11111111-2222-3333-4444-555555555555 (this boot session)");
+
+  // The driver reloaded since: it holds nothing, whatever the settings say.
+  fs::rename(device.dir() / "driver", device.dir() / "driver.kept");
+  EXPECT_EQ(verdict(), "empty") << report;
+  EXPECT_EQ(field("next step"), "rcmodel upload");
+  fs::rename(device.dir() / "driver.kept", device.dir() / "driver");
 
   // The model file changed after the upload.
   device.installModel("T618e/2168.rcmodel",
@@ -267,6 +277,7 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
   fs::remove(model);
   EXPECT_EQ(verdict(), "missing") << report;
   EXPECT_EQ(field("model file exists"), "no");
+  EXPECT_EQ(field("next step"), "install the model as " + model.string() + ", then rcmodel upload");
   fs::create_directory(model);
   EXPECT_EQ(verdict(), "missing") << report;
   EXPECT_EQ(field("model file exists"), "no, not a regular file");
@@ -283,6 +294,59 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
                       "record carries 303\n"))
       << report;
   EXPECT_EQ(readFile(device.statePath()), state);
+
+  // A driver missing is said before anything else, and no model path is
+  // blamed for it.
+  for (const char* driver : {"TesvarSmartBattery", "TesvarKVR"}) {
+    json["registry"] = test::defaultDeviceJSON()["registry"];
+    json["registry"].erase(driver);
+    device.writeDeviceJSON(json);
+    EXPECT_EQ(verdict(), "no driver") << report;
+    EXPECT_TRUE(matches(report, driver == std::string("TesvarKVR")
+                                    ? "^device: [^\n]*\nbattery driver: +found\npower-management "
+                                      "driver: not found: no device stands for TesvarKVR\n"
+                                    : "^device: [^\n]*\nbattery driver: +not found: no power "
+                                      "supply stands for TesvarSmartBattery\n[\\s\\S]*\nchem ID: "
+                                      "+\\(none: no battery driver; the daemon would use 0\\)"))
+        << report;
+  }
+}
+
+// rcmodel upload: the daemon's own transfer, or the record of a given file,
+// sent to the driver now and verified against the hash it publishes; the
+// daemon's settings are left as they were. Each refusal is one line, and then
+// nothing reaches the driver. The uses are in rcmodel_uploads.json: the
+// device is the example one with "device" merged into its device.json, its
+// model installed unless "model" is false; "held" names the file whose record
+// the driver then holds (MODEL: the installed one).
+TEST_F(Rcmodel, UploadSendsTheRecordNowAndLeavesTheSettings) {
+  const std::string settings = R"({"savedBootUUID": "earlier", "savedChemID": 1})";
+  const auto uses =
+      nlohmann::json::parse(readFile(KOLVRAND_SOURCE_DIR "/tests/tools/rcmodel_uploads.json"));
+  for (const auto& use : uses) {
+    SCOPED_TRACE(use.dump());
+    auto json = test::defaultDeviceJSON();
+    json.merge_patch(use.value("device", nlohmann::json::object()));
+    test::TestDevice device(json);
+    const fs::path model = device.dir() / "Library/KVR/BatteryModels/T618e/2168.rcmodel";
+    // Another model than "good", so that what the driver holds tells them apart.
+    if (use.value("model", true))
+      writeFile(model, exampleFile([](OTAParamRC& m) { m.setChemID(1); }));
+    writeFile(device.statePath(), settings);
+    ToolRun run = s.rcmodel(use["args"], "", device.dir().string());
+    EXPECT_EQ(run.status, use["status"].get<int>());
+    const std::string err = use.value("err", "");
+    EXPECT_TRUE(err.empty() ? run.err.empty() : matches(run.err, err)) << run.err;
+    EXPECT_TRUE(matches(run.out, use["out"].get<std::string>())) << run.out;
+    const fs::path sent = device.dir() / "driver/battery_params.bin";
+    const std::string held = use.value("held", "");
+    EXPECT_EQ(fs::exists(sent), !held.empty());
+    if (!held.empty()) {
+      s.rcmodel({"record", held == "MODEL" ? model.string() : held, "-o", "expected.bin"});
+      EXPECT_EQ(readFile(sent), readFile(s / "expected.bin"));
+    }
+    EXPECT_EQ(readFile(device.statePath()), settings);
+  }
 }
 
 }  // namespace

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: MIT
-// rcmodel status: what the daemon on this device would load and whether the
-// driver holds it. Read-only: it reads what the daemon reads, through the
-// daemon's own code, and never uploads or writes a setting.
+// rcmodel status: what is wrong with the device, what the daemon on it would
+// load and whether the driver holds it. Read-only: it reads what the daemon
+// reads, through the daemon's own code, and never uploads or writes a setting.
 #include <algorithm>
 #include <cstdio>
 #include <cstdlib>
@@ -10,13 +10,14 @@
 
 #include "base/CommonCrypto.h"
 #include "base/Utf8.h"
-#include "daemon/BatteryModelTask.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
+#include "pipeline/BootSession.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "pipeline/KextBatteryModel.h"
 #include "platform/Backend.h"
 #include "platform/Defaults.h"
+#include "tools/rcmodel/DeviceReport.h"
 #include "tools/rcmodel/Tool.h"
 
 namespace kolvrand::rcmodel {
@@ -27,22 +28,31 @@ constexpr const char* kHelp = R"HELP(usage: rcmodel status
 
 Reports, for the device in use (this host, or the simulated device in the
 directory named by KOLVRAND_DEVICE), what the daemon would do, without doing
-any of it: the current and the saved boot-session UUID, the battery's chem ID,
-the device type and the serial-number suffix, the model file the daemon would
-load, whether it exists and decodes, the SHA-1 of the record it would send, the
-hash the driver publishes, and a verdict:
+any of it. First what is wrong with the device: whether the battery driver and
+the power-management driver are there and whether the latter holds a record.
+Then the current and the saved boot-session UUID, the battery's chem ID (and
+the one the battery reports, when the daemon reads it as another), the device
+type and the serial-number suffix, the model file the daemon would load,
+whether it exists and decodes, the SHA-1 of the record it would send, the hash
+the driver publishes, a verdict and, where something would help, the next step:
 
-  loaded    the daemon uploaded in this boot session and the driver holds
-            exactly this model's record
-  stale     the daemon has not uploaded in this boot session; its next start will
-  mismatch  the driver holds another record than this model's (the model file
-            changed since the upload, or the upload was not confirmed)
-  missing   there is no model file, or it does not decode, or the daemon would
-            refuse it
-  unknown   the daemon's settings (as for a user who may not read its state
-            directory) or the boot session cannot be read, so whether the
-            daemon uploaded in this boot session cannot be told; the report
-            says why
+  loaded     the daemon uploaded in this boot session and the driver holds
+             exactly this model's record
+  no driver  the battery driver or the power-management driver is not loaded
+  missing    there is no model file, or it does not decode, or the daemon would
+             refuse it
+  empty      the driver holds no record (it was loaded or reloaded after the
+             daemon's upload, or the daemon has not uploaded yet)
+  unknown    the daemon's settings (as for a user who may not read its state
+             directory) or the boot session cannot be read, so whether the
+             daemon uploaded in this boot session cannot be told; the report
+             says why
+  stale      the daemon has not uploaded in this boot session
+  mismatch   the driver holds another record than this model's (the model
+             file changed since the upload, or the upload was not confirmed)
+
+`rcmodel upload` loads the model into the driver now, for empty, stale and
+mismatch alike.
 
 Every value read from the device is shown with control characters and bytes
 that are no UTF-8 as escapes (\n, \x1b).
@@ -70,25 +80,8 @@ class Collect : public LogSink {
   std::vector<std::string> lines_;
 };
 
-// One line of the report; `value` is shown as visibleText shows it, since it
-// comes from the device (a target type, a path, a line the daemon logged).
-void line(const char* key, const std::string& value) {
-  std::printf("%-20s %s\n", (std::string(key) + ":").c_str(), visibleText(value).c_str());
-}
-
 std::string orNone(const std::optional<std::string>& s) {
   return s ? (s->empty() ? "(empty)" : *s) : "(none)";
-}
-
-// The hash the driver publishes under KVRVector / KVRBatteryModel / RCParamsHash.
-std::optional<Data> publishedHash(BatteryModelDataHandler& handler) {
-  std::optional<Dictionary> kvrVector;
-  if (!handler.getKVRDebugDict(&kvrVector) || !kvrVector) return std::nullopt;
-  const Value* model = kvrVector->find("KVRBatteryModel");
-  if (!model || !model->isDictionary()) return std::nullopt;
-  const Value* hash = model->asDictionary()->find("RCParamsHash");
-  if (!hash || !hash->isData()) return std::nullopt;
-  return *hash->asData();
 }
 
 int run(const Arguments& a) {
@@ -101,9 +94,20 @@ int run(const Arguments& a) {
   auto collect = std::make_shared<Collect>();
   setLogSink(collect);
   setLogLevelSpec("error");
+  const auto line = reportLine;
 
-  const char* device = std::getenv("KOLVRAND_DEVICE");
-  line("device", device && *device ? std::string("simulated device ") + device : "this host");
+  // What is wrong with the device comes first: without a driver, what
+  // follows (a chem ID of 0, a model path made from it) is only what the
+  // daemon would make of its absence.
+  line("device", deviceName());
+  const std::shared_ptr<BatteryModelDataHandler> handler = handlerWithoutSettings();
+  const bool battery = batteryDriverFound(), power = powerDriverFound();
+  const std::optional<Data> published = power ? publishedHash(*handler) : std::nullopt;
+  line("battery driver",
+       battery ? "found" : "not found: no power supply stands for TesvarSmartBattery");
+  line("power-management driver", !power      ? "not found: no device stands for TesvarKVR"
+                                  : published ? "found, holds a record"
+                                              : "found, holds no record");
 
   const std::optional<std::string> current = currentBootSessionUUID();
   std::optional<std::string> saved;
@@ -120,13 +124,9 @@ int run(const Arguments& a) {
                                  ? "(cannot be read: " + unreadable + ")"
                                  : orNone(saved) + (thisSession ? " (this boot session)" : ""));
 
-  // A handler without defaults reads the chem ID without storing it.
-  auto handler = std::make_shared<BatteryModelDataHandler>();
-  handler->setLog(os_log_create(DaemonIdentifier, "batteryModelDataHandling"));
   const uint32_t chemID = handler->getBatteryChemID();
-  char chem[48];
-  std::snprintf(chem, sizeof chem, "0x%x (%u)", chemID, chemID);
-  line("chem ID", chem);
+  line("chem ID", battery ? chemIDText(*handler, chemID)
+                          : "(none: no battery driver; the daemon would use 0)");
   line("device type", orNone(handler->getDeviceType(chemID)));
   const std::string suffix = handler->getSpecialCaseBatteryModelIdentifier(chemID);
   line("suffix", suffix.empty() ? "(none)" : suffix);
@@ -139,7 +139,7 @@ int run(const Arguments& a) {
   if (found) model = handler->loadProtobufModelWithFileName(found);
   std::error_code ec;
   const bool regular = found && std::filesystem::is_regular_file(*found, ec);
-  line("model file", orNone(path));
+  line("model file", orNone(path) + (battery ? "" : " (from chem ID 0: no battery driver)"));
   line("model file exists", !found ? "no" : regular ? "yes" : "no, not a regular file");
   line("model decodes", !regular ? "-" : model ? "yes" : "no");
 
@@ -150,21 +150,36 @@ int run(const Arguments& a) {
   line("record SHA-1", recordHash ? hexString(recordHash->data(), recordHash->size())
                        : model    ? "(refused by the record builder)"
                                   : "-");
-
-  const std::optional<Data> published = publishedHash(*handler);
   line("driver's hash",
        published ? hexString(published->data(), published->size()) : "(none published)");
 
+  const bool holdsIt =
+      recordHash && published && *published == Data(recordHash->begin(), recordHash->end());
   const char* verdict = "loaded";
-  if (!recordHash)
+  std::string next = "rcmodel upload";
+  if (!battery || !power) {
+    verdict = "no driver";
+    next = !battery ? "load the battery driver (the reference one: modprobe tesvar_smart_battery)"
+                    : "load the power-management driver (the reference one: modprobe tesvar_kvr)";
+  } else if (!recordHash) {
     verdict = "missing";
-  else if (!current || !unreadable.empty())
+    next = !found && path ? "install the model as " + *path + ", then rcmodel upload"
+           : found        ? "rcmodel validate " + *found + " says why the daemon refuses it"
+                          : "";
+  } else if (!published) {
+    verdict = "empty";
+  } else if (!current || !unreadable.empty()) {
     verdict = "unknown";
-  else if (!thisSession)
+    if (holdsIt) next.clear();
+  } else if (!thisSession) {
     verdict = "stale";
-  else if (!published || *published != Data(recordHash->begin(), recordHash->end()))
+  } else if (!holdsIt) {
     verdict = "mismatch";
+  } else {
+    next.clear();
+  }
   line("verdict", verdict);
+  if (!next.empty()) line("next step", next);
 
   // The device type is asked for twice (for the report and for the path), so
   // a failure to read it would show twice.

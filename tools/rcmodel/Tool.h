@@ -53,7 +53,7 @@ struct Command {
   int (*run)(const Arguments&);
 };
 
-extern const Command kDecode, kEncode, kRecord, kValidate, kPlot, kStatus;
+extern const Command kDecode, kEncode, kRecord, kValidate, kPlot, kStatus, kUpload;
 
 // Parses `args` for `command` and runs it: the exit code.
 int runCommand(const Command& command, const std::vector<std::string>& args);

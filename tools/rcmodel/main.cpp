@@ -21,8 +21,10 @@ Commands:
                                    and print its SHA-1
   validate FILE...                 check that each file decodes and fills the record
   plot FILE -o OUT.svg             draw the OCV grid and the resistance tables
-  status                           what the daemon on this device would load, and whether
-                                   the driver holds it (read-only)
+  status                           what the daemon on this device would load, whether the
+                                   driver holds it, and what is wrong first (read-only)
+  upload [FILE]                    upload the daemon's model (or FILE's) to the driver now
+                                   and verify it
 
 Run `rcmodel COMMAND --help` for the details of one command, `rcmodel --version`
 for the version (that of the daemon whose code it runs).
@@ -31,13 +33,14 @@ Exit status: 0 on success; 1 when a model cannot be decoded, would be refused by
 the daemon, or a file cannot be read or written; 2 for a wrong command line or
 wrong JSON.
 
-Environment: KOLVRAND_DEVICE=DIR makes status look at the simulated device in DIR
-instead of this host.
+Environment: KOLVRAND_DEVICE=DIR makes status and upload use the simulated device
+in DIR instead of this host.
 )HELP";
 
 constexpr const kolvrand::rcmodel::Command* kCommands[] = {
     &kolvrand::rcmodel::kDecode,   &kolvrand::rcmodel::kEncode, &kolvrand::rcmodel::kRecord,
     &kolvrand::rcmodel::kValidate, &kolvrand::rcmodel::kPlot,   &kolvrand::rcmodel::kStatus,
+    &kolvrand::rcmodel::kUpload,
 };
 
 }  // namespace
