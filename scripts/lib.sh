@@ -26,13 +26,17 @@ KOLVRAND_PACKAGES=(cmake ninja-build g++ clang pkg-config libssl-dev nlohmann-js
 # the names that differ between the releases the scripts run on; every
 # install_missing goes through it, so this is the one place they live.
 #   systemd-dev: trixie's package of systemd.pc and udev.pc, which bookworm
-#     ships in systemd and udev themselves.
+#     ships in systemd and udev themselves;
+#   libssl3, libelf1: trixie's are libssl3t64 and libelf1t64 (its 64-bit
+#     time_t transition), as bookworm's kbuild packages name them.
 release_package() {
   local suite=$1 p
   shift
   for p in "$@"; do
     case $suite:$p in
       bookworm:systemd-dev) echo systemd udev ;;
+      bookworm:libssl3t64 | bookworm:libelf1t64) echo "${p%t64}" ;;
+      trixie:libssl3 | trixie:libelf1) echo "${p}t64" ;;
       *) echo "$p" ;;
     esac
   done
@@ -220,7 +224,7 @@ run_in() {
     exec chroot "$root" "$@"'
   local args=() b
   for b in "${binds[@]}"; do args+=("${b%%:*}" "${b#*:}"); done
-  unshare --mount --pid --fork --propagation private --mount-proc="$root/proc" \
+  unshare --mount --pid --fork --kill-child --propagation private --mount-proc="$root/proc" \
     bash -c "$script" run_in "$root" "${#binds[@]}" "${args[@]}" \
     /usr/bin/env -i PATH=/usr/local/sbin:/usr/local/bin:/usr/sbin:/usr/bin:/sbin:/bin HOME=/root \
     DEBIAN_FRONTEND=noninteractive LC_ALL=C.UTF-8 TERM="${TERM:-dumb}" ${CI:+CI="$CI"} \
