@@ -11,6 +11,7 @@
 #include <cstring>
 #include <vector>
 
+#include "base/CommonCrypto.h"
 #include "bench/AllocationCounter.h"
 #include "bench/BootPath.h"
 #include "bench/Fixture.h"
@@ -18,7 +19,6 @@
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "pipeline/KextBatteryModel.h"
-#include "platform/CommonCrypto.h"
 #include "platform/IOKit.h"
 
 namespace kolvrand::bench {

@@ -3,9 +3,9 @@
 
 #include <memory>
 
+#include "base/Utf8.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "platform/Sysctl.h"
-#include "platform/Utf8.h"
 
 namespace kolvrand {
 

@@ -6,11 +6,11 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "base/Value.h"
 #include "model/FieldStorage.h"
 #include "model/FieldTable.h"
 #include "model/PBDataReader.h"
 #include "model/PBDataWriter.h"
-#include "platform/Value.h"
 
 namespace kolvrand {
 struct DictionaryError;

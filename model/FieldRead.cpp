@@ -245,13 +245,35 @@ void readUnpackedRun(PBDataReader& reader, MutableFields& fields, PBRepeatedFloa
 
 }  // namespace
 
+// Tells an observer, if the reader has one, where a message's fields begin and end.
+class ObservedMessage {
+ public:
+  explicit ObservedMessage(WireObserver* observer) : observer_(observer) {
+    if (observer_) observer_->beginMessage();
+  }
+  ~ObservedMessage() {
+    if (observer_) observer_->endMessage();
+  }
+  ObservedMessage(const ObservedMessage&) = delete;
+  ObservedMessage& operator=(const ObservedMessage&) = delete;
+
+ private:
+  WireObserver* observer_;
+};
+
 bool readFields(const MessageTable& table, MutableFields fields, PBDataReader& reader) {
+  WireObserver* const observer = reader.observer();
+  const ObservedMessage observed(observer);
   while (!reader.hasError() && !reader.isAtEnd()) {
     const size_t tagStart = reader.position();
     const uint64_t tag = reader.readVarint();
     if (reader.hasError()) break;
+    if (observer) observer->tag(tagStart, tag, reader.position() - tagStart);
     const auto wireType = static_cast<uint8_t>(tag & 7);
-    if (wireType == wire::kEndGroup) break;
+    if (wireType == wire::kEndGroup) {
+      if (observer) observer->endGroup(reader.remaining());
+      break;
+    }
     const auto number = static_cast<uint32_t>(tag >> 3);
 
     const FieldDescriptor* d = table.find(number);
@@ -259,6 +281,7 @@ bool readFields(const MessageTable& table, MutableFields fields, PBDataReader& r
       if (!PBReaderSkipValueWithTag(reader, number, wireType)) return false;
       continue;
     }
+    if (observer) observer->field(*d, wireType);
     switch (d->kind) {
       case FieldKind::SubMessage: {
         // A repeated occurrence replaces the earlier one instead of merging
@@ -281,6 +304,9 @@ bool readFields(const MessageTable& table, MutableFields fields, PBDataReader& r
           if (!PBReaderPlaceMark(reader, mark)) return false;
           readPackedRun(reader, fields, list);
           PBReaderRecallMark(reader, mark);
+        } else if (observer) {
+          // One element a turn, so that the observer is told of every tag.
+          list.add(reader.readFloat());
         } else {
           readUnpackedRun(reader, fields, list, reader.bytes() + tagStart,
                           reader.position() - tagStart);

@@ -9,9 +9,9 @@
 #include <string>
 #include <vector>
 
+#include "base/Value.h"
 #include "model/PBDataReader.h"
 #include "model/PBDataWriter.h"
-#include "platform/Value.h"
 
 namespace kolvrand {
 

@@ -3,32 +3,12 @@
 
 namespace kolvrand {
 
-uint64_t PBDataReader::readVarintUnchecked() {
-  const uint8_t* p = cursor();
-  uint64_t value = 0;
-  for (size_t i = 0; i < wire::kMaxVarintSize; ++i) {
-    value |= uint64_t{p[i] & 0x7fu} << (7 * i);
-    if (p[i] < 0x80) {
-      pos_ += i + 1;
-      return value;
-    }
-  }
-  pos_ += wire::kMaxVarintSize;
-  return 0;
-}
-
-uint64_t PBDataReader::readVarintChecked() {
-  uint64_t value = 0;
-  for (size_t i = 0; i < wire::kMaxVarintSize; ++i) {
-    if (pos_ >= limit_) {
-      error_ = true;
-      return 0;
-    }
-    const uint8_t b = bytes_[pos_++];
-    value |= uint64_t{b & 0x7fu} << (7 * i);
-    if (b < 0x80) return value;
-  }
-  return 0;
+uint64_t PBDataReader::readLongerVarint() {
+  const wire::Varint v = wire::readVarint(cursor(), remaining());
+  if (v.status == wire::VarintStatus::CutShort) error_ = true;
+  if (v.status == wire::VarintStatus::OverLong && observer_) observer_->overLongVarint(pos_);
+  pos_ += v.size;
+  return v.value;
 }
 
 void PBDataReader::makeFloats() {

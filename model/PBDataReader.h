@@ -15,6 +15,33 @@
 
 namespace kolvrand {
 
+namespace detail {
+struct FieldDescriptor;
+}
+
+// Told what the reader and the read functions meet, in the order they meet
+// it, when one is set on the reader (rcmodel's wire check watches the
+// daemon's own reading this way). Positions are offsets into the reader's
+// bytes.
+class WireObserver {
+ public:
+  virtual ~WireObserver() = default;
+  // A message's fields begin and end; sub-messages nest.
+  virtual void beginMessage() = 0;
+  virtual void endMessage() = 0;
+  // A tag of `size` bytes at `at`.
+  virtual void tag(size_t at, uint64_t tag, size_t size) = 0;
+  // A varint at `at` whose tenth byte still continues, read as 0.
+  virtual void overLongVarint(size_t at) = 0;
+  // The tag last told is an end-group tag that ends the message, `after`
+  // bytes before the end of its run.
+  virtual void endGroup(size_t after) = 0;
+  // The tag last told names a known field.
+  virtual void field(const detail::FieldDescriptor& field, uint8_t wireType) = 0;
+  // The tag last told has a wire type that does not exist (6 or 7).
+  virtual void noSuchWireType(uint8_t wireType) = 0;
+};
+
 // The limit that was in force before a length-delimited run was entered.
 struct PBDataReaderMark {
   size_t limit = 0;
@@ -36,14 +63,16 @@ class PBDataReader {
   bool hasError() const { return error_; }
   void setError() { error_ = true; }
 
+  WireObserver* observer() const { return observer_; }
+  void setObserver(WireObserver* observer) { observer_ = observer; }
+
   const uint8_t* cursor() const { return bytes_ + pos_; }
   // Requires n <= remaining().
   void advance(size_t n) { pos_ += n; }
 
-  // A base-128 varint, least significant group first, at most 10 bytes.
-  // Running into the limit sets the error flag and yields 0. A 10th byte that
-  // still has its top bit set yields 0 without an error; the 10 bytes are
-  // consumed.
+  // A varint (wire::readVarint). Running into the limit sets the error flag
+  // and yields 0. A 10th byte that still has its top bit set yields 0 without
+  // an error; the 10 bytes are consumed.
   uint64_t readVarint() {
     // One and two bytes inline: every tag of the model and most lengths.
     if (remaining() >= 2) {
@@ -58,8 +87,7 @@ class PBDataReader {
         return (b0 & 0x7fu) | (uint64_t{b1} << 7);
       }
     }
-    if (remaining() >= wire::kMaxVarintSize) return readVarintUnchecked();
-    return readVarintChecked();
+    return readLongerVarint();
   }
 
   // Room for the floats of the lists being decoded. Every list decoded from
@@ -108,9 +136,7 @@ class PBDataReader {
   }
 
  private:
-  // Requires remaining() >= 10.
-  uint64_t readVarintUnchecked();
-  uint64_t readVarintChecked();
+  uint64_t readLongerVarint();
   void makeFloats();
 
   friend bool PBReaderPlaceMark(PBDataReader& reader, PBDataReaderMark& mark);
@@ -121,6 +147,7 @@ class PBDataReader {
   size_t limit_;
   size_t length_;
   bool error_ = false;
+  WireObserver* observer_ = nullptr;
   std::shared_ptr<float[]> floats_;  // made at the first takeFloats
   size_t floatsUsed_ = 0;
   size_t floatsSize_ = 0;

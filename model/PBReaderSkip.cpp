@@ -48,11 +48,14 @@ bool PBReaderSkipValueWithTag(PBDataReader& reader, uint32_t fieldNumber, uint8_
         if (!skipBytes(reader, 4)) return false;
         break;
       default:
+        if (reader.observer()) reader.observer()->noSuchWireType(wireType);
         return false;
     }
     if (depth == 0) return true;
+    const size_t tagStart = reader.position();
     const uint64_t tag = reader.readVarint();
     if (reader.hasError()) return false;
+    if (reader.observer()) reader.observer()->tag(tagStart, tag, reader.position() - tagStart);
     fieldNumber = static_cast<uint32_t>(tag >> 3);
     wireType = static_cast<uint8_t>(tag & 7);
   }

@@ -50,11 +50,6 @@ void PBRepeatedFloat::append(const PBRepeatedFloat& other) {
   std::memcpy(appendUninitialized(n), other.values_, n * sizeof(float));
 }
 
-void PBRepeatedFloat::appendLittleEndian(const uint8_t* bytes, size_t count) {
-  if (count == 0) return;
-  wire::loadFloats(appendUninitialized(count), bytes, count);
-}
-
 bool PBRepeatedFloatIsEqual(const PBRepeatedFloat& a, const PBRepeatedFloat& b) {
   if (a.size() != b.size()) return false;
   return std::equal(a.elements(), a.elements() + a.size(), b.elements());

@@ -10,7 +10,7 @@
 #include <cstdint>
 #include <memory>
 
-#include "platform/Value.h"
+#include "base/Value.h"
 
 namespace kolvrand {
 
@@ -88,10 +88,6 @@ class PBRepeatedFloat {
     size_ += count;
     return out;
   }
-
-  // Appends `count` floats stored little-endian at `bytes`, which must hold
-  // 4 * count readable bytes.
-  void appendLittleEndian(const uint8_t* bytes, size_t count);
 
  private:
   [[noreturn]] static void throwOutOfRange(size_t index, size_t count);

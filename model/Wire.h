@@ -20,6 +20,34 @@ enum WireType : uint8_t {
 
 inline constexpr size_t kMaxVarintSize = 10;
 
+// What reading one varint found.
+enum class VarintStatus : uint8_t {
+  Ok,
+  CutShort,  // the bytes ended before a byte with a clear top bit
+  OverLong,  // the tenth byte still has its top bit set
+};
+
+struct Varint {
+  uint64_t value;  // 0 unless Ok
+  size_t size;     // the bytes taken: all there were when cut short, ten when over-long
+  VarintStatus status;
+};
+
+// The base-128 varint, least significant group first, at `p`, before which
+// `available` bytes remain; at most kMaxVarintSize bytes are read. Every
+// reader of the wire format reads its varints with this, and decides itself
+// what a cut-short or over-long one means.
+constexpr Varint readVarint(const uint8_t* p, size_t available) {
+  const size_t n = available < kMaxVarintSize ? available : kMaxVarintSize;
+  uint64_t value = 0;
+  for (size_t i = 0; i < n; ++i) {
+    value |= uint64_t{p[i] & 0x7fu} << (7 * i);
+    if (p[i] < 0x80) return {value, i + 1, VarintStatus::Ok};
+  }
+  if (n < kMaxVarintSize) return {0, n, VarintStatus::CutShort};
+  return {0, kMaxVarintSize, VarintStatus::OverLong};
+}
+
 constexpr size_t varintSize(uint64_t value) {
   size_t n = 1;
   for (; value >= 0x80; value >>= 7) ++n;
@@ -57,16 +85,6 @@ inline void storeFloat(uint8_t* p, float value) {
   uint32_t bits = std::bit_cast<uint32_t>(value);
   if constexpr (std::endian::native == std::endian::big) bits = __builtin_bswap32(bits);
   std::memcpy(p, &bits, sizeof bits);
-}
-
-// `count` floats stored little-endian at `p`, which must hold 4 * count
-// readable bytes, into `out`.
-inline void loadFloats(float* out, const uint8_t* p, size_t count) {
-  if constexpr (std::endian::native == std::endian::little) {
-    if (count) std::memcpy(out, p, count * sizeof(float));
-  } else {
-    for (size_t i = 0; i < count; ++i) out[i] = loadFloat(p + 4 * i);
-  }
 }
 
 // `count` floats stored little-endian at `p`, which must have room for

@@ -8,8 +8,8 @@
 #include <optional>
 #include <string>
 
+#include "base/Value.h"
 #include "pipeline/DaemonAgent.h"
-#include "platform/Value.h"
 
 namespace kolvrand {
 

@@ -5,9 +5,9 @@
 #include <array>
 #include <cstring>
 
+#include "base/Utf8.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "platform/Sysctl.h"
-#include "platform/Utf8.h"
 
 namespace kolvrand {
 

@@ -4,9 +4,9 @@
 #include <algorithm>
 #include <cstring>
 
+#include "base/CommonCrypto.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/KextBatteryModel.h"
-#include "platform/CommonCrypto.h"
 #include "platform/IOKit.h"
 
 namespace kolvrand {

@@ -1,16 +1,19 @@
 // SPDX-License-Identifier: MIT
 #include "pipeline/PBStreamReader.h"
 
+#include <cerrno>
+
 #include "platform/FileManager.h"
 
 namespace kolvrand {
 
 std::optional<PBStreamReader::FileContents> PBStreamReader::readFileContents(
     const std::string& path, NSError* error) {
-  std::string why;
-  auto file =
-      NSFileManager::defaultManager().contentsOfRegularFile(path, kMaxFileSize, "model file", &why);
-  if (!file && error) error->localizedDescription = std::move(why);
+  FileError why;
+  auto file = readRegularFile(path, kMaxFileSize, &why);
+  if (!file && error)
+    error->localizedDescription =
+        path + ": " + why.reason + (why.code == EFBIG ? " for a model file" : "");
   return file;
 }
 
@@ -24,25 +27,16 @@ std::optional<std::vector<uint8_t>> PBStreamReader::readFile(const std::string& 
 bool PBStreamReader::nextFrame(std::span<const uint8_t> bytes, size_t* offset,
                                std::span<const uint8_t>* body, size_t index, NSError* error) {
   const size_t start = *offset;
-  uint64_t length = 0;
-  size_t pos = start;
-  for (int shift = 0;; shift += 7) {
-    if (pos >= bytes.size()) {
-      if (error)
-        *error = {"the length of message " + std::to_string(index) + " at offset " +
-                  std::to_string(start) + " is cut short"};
-      return false;
-    }
-    if (shift == 63 && bytes[pos] > 1) {
-      if (error)
-        *error = {"the length of message " + std::to_string(index) + " at offset " +
-                  std::to_string(start) + " is not a valid varint"};
-      return false;
-    }
-    uint8_t b = bytes[pos++];
-    length |= uint64_t{b & 0x7fu} << shift;
-    if (!(b & 0x80)) break;
+  const wire::Varint v = wire::readVarint(bytes.data() + start, bytes.size() - start);
+  if (v.status != wire::VarintStatus::Ok) {
+    if (error)
+      *error = {
+          "the length of message " + std::to_string(index) + " at offset " + std::to_string(start) +
+          (v.status == wire::VarintStatus::CutShort ? " is cut short" : " is not a valid varint")};
+    return false;
   }
+  const uint64_t length = v.value;
+  const size_t pos = start + v.size;
   const size_t remaining = bytes.size() - pos;
   if (length > remaining) {
     if (error)

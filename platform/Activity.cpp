@@ -47,8 +47,8 @@ void xpc_activity_register(const char* identifier, xpc_criteria_t, xpc_activity_
   Service& s = service();
   std::lock_guard lock(s.mutex);
   if (!s.queue)
-    s.queue = std::make_shared<DispatchQueue>(
-        std::string(platform::kPlatformSubsystem) + ".activity", DISPATCH_QUEUE_SERIAL);
+    s.queue =
+        std::make_shared<DispatchQueue>(std::string(platform::kPlatformSubsystem) + ".activity");
   // Registering an identifier again replaces its handler.
   std::erase_if(s.registrations, [&](const auto& e) { return e->identifier == r->identifier; });
   s.registrations.push_back(r);

@@ -12,7 +12,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Value.h"
+#include "base/Value.h"
 
 namespace kolvrand::platform {
 

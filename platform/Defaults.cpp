@@ -12,14 +12,12 @@
 #include <map>
 #include <mutex>
 
+#include "base/ValueJSON.h"
 #include "platform/Backend.h"
 #include "platform/FileManager.h"
 #include "platform/Internal.h"
-#include "platform/ValueJSON.h"
 
 namespace kolvrand {
-
-using platform::JSON;
 
 struct NSUserDefaults::Suite {
   std::filesystem::path path;      // STATE/SUITE.json
@@ -77,11 +75,11 @@ class FileLock {
 // beyond the size of any settings is unreadable: it never blocks the reader
 // or takes its memory.
 JSON readSuite(const std::filesystem::path& path) {
-  int err = 0;
-  std::string why;
-  auto text = readSmallFile(path.string(), platform::kMaxSmallFileSize, &why, &err);
+  FileError error;
+  auto text = platform::readFile(path, &error);
   if (!text) {
-    if (err != ENOENT) os_log_error(defaultsLog(), "cannot read %s: %s\n", path.string(), why);
+    if (error.code != ENOENT)
+      os_log_error(defaultsLog(), "cannot read %s: %s\n", path.string(), error.reason);
     return JSON::object();
   }
   JSON j = JSON::parse(*text, nullptr, false);
@@ -165,10 +163,9 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(
   // A suite that is not there is no error; one that may be there but cannot
   // be read (a directory the caller may not search, a file it may not read)
   // is, since its values are then unknown rather than absent.
-  int err = 0;
-  std::string reason;
-  if (!readSmallFile(shared->path.string(), platform::kMaxSmallFileSize, &reason, &err)) {
-    if (why && err != ENOENT) *why = shared->path.string() + ": " + reason;
+  FileError error;
+  if (!platform::readFile(shared->path, &error)) {
+    if (why && error.code != ENOENT) *why = shared->path.string() + ": " + error.reason;
     return nullptr;
   }
   return std::make_shared<NSUserDefaults>(std::move(shared));
@@ -185,11 +182,11 @@ JSON load(NSUserDefaults::Suite& s) {
   return readSuite(s.path);
 }
 
-// A writer killed between creating its temporary file (SUITE.json.XXXXXX)
+// A writer killed between creating its temporary file (.SUITE.json.XXXXXX)
 // and renaming it leaves that file behind. Temporaries are made only under
 // the exclusive lock, so any found while holding it is such a leftover.
 void removeStaleTemporaries(const std::filesystem::path& path) {
-  const std::string prefix = path.filename().string() + ".";
+  const std::string prefix = "." + path.filename().string() + ".";
   std::error_code ec;
   for (std::filesystem::directory_iterator it(path.parent_path(), ec), end; !ec && it != end;
        it.increment(ec)) {
@@ -222,10 +219,12 @@ bool update(NSUserDefaults::Suite& s, std::string_view key, F&& modify) {
   removeStaleTemporaries(s.path);
   JSON content = readSuite(s.path);
   modify(content);
-  std::string error;
-  if (!platform::writeFileAtomically(
-          s.path, content.dump(2, ' ', false, JSON::error_handler_t::replace) + "\n", &error)) {
-    os_log_error(defaultsLog(), "%s; %s not written\n", error, key);
+  std::string step;
+  if (int err =
+          replaceFile(s.path, content.dump(2, ' ', false, JSON::error_handler_t::replace) + "\n",
+                      0600, &step)) {
+    os_log_error(defaultsLog(), "%s: %s: %s; %s not written\n", s.path.string(), step,
+                 std::strerror(err), key);
     return false;
   }
   return true;

@@ -140,12 +140,9 @@ void stopAllQueues() {
 
 struct DispatchQueue::State {
   std::shared_ptr<Core> core;
-  dispatch_queue_attr_t attr;
 };
 
-DispatchQueue::DispatchQueue(std::string label, dispatch_queue_attr_t attr)
-    : s_(std::make_unique<State>()) {
-  s_->attr = attr;
+DispatchQueue::DispatchQueue(std::string label) : s_(std::make_unique<State>()) {
   s_->core = std::make_shared<Core>();
   s_->core->label = std::move(label);
   // The worker starts with the served signals blocked whatever the creating
@@ -215,13 +212,13 @@ dispatch_queue_attr_t dispatch_queue_attr_make_with_autorelease_frequency(
   return attr;
 }
 
-dispatch_queue_t dispatch_queue_create(const char* label, dispatch_queue_attr_t attr) {
+dispatch_queue_t dispatch_queue_create(const char* label, dispatch_queue_attr_t) {
   static std::once_flag masked;
   std::call_once(masked, [] {
     sigset_t served = servedSignals();
     pthread_sigmask(SIG_BLOCK, &served, nullptr);
   });
-  return std::make_shared<DispatchQueue>(label ? label : "", attr);
+  return std::make_shared<DispatchQueue>(label ? label : "");
 }
 
 void dispatch_async(const dispatch_queue_t& queue, dispatch_block_t block) {

@@ -15,7 +15,6 @@ using dispatch_queue_t = std::shared_ptr<DispatchQueue>;
 using dispatch_block_t = std::function<void()>;
 
 struct dispatch_queue_attr_t {
-  bool serial = true;
   uint64_t autoreleaseFrequency = 0;
 };
 
@@ -27,8 +26,9 @@ dispatch_queue_attr_t dispatch_queue_attr_make_with_autorelease_frequency(
     dispatch_queue_attr_t attr, uint64_t frequency);
 
 // A serial queue whose worker thread runs the submitted blocks one at a time,
-// in submission order. With DISPATCH_AUTORELEASE_FREQUENCY_WORK_ITEM every block
-// (and all it captured) is destroyed as soon as it has run. The first queue a
+// in submission order. Every block (and all it captured) is destroyed as soon
+// as it has run, which is what DISPATCH_AUTORELEASE_FREQUENCY_WORK_ITEM asks
+// for; the attribute is taken for the call's sake and changes nothing. The first queue a
 // process creates blocks SIGTERM, SIGINT and SIGUSR1 in the calling thread, so
 // every thread created afterwards leaves them to dispatch_main.
 dispatch_queue_t dispatch_queue_create(const char* label, dispatch_queue_attr_t attr);
@@ -36,7 +36,7 @@ void dispatch_async(const dispatch_queue_t& queue, dispatch_block_t block);
 
 class DispatchQueue {
  public:
-  DispatchQueue(std::string label, dispatch_queue_attr_t attr);
+  explicit DispatchQueue(std::string label);
   ~DispatchQueue();  // finishes the block in progress, drops the rest, joins
   const std::string& label() const;
   void async(dispatch_block_t block);

@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
@@ -37,48 +38,6 @@ bool NSFileManager::fileExistsAtPath(const std::string& path) const {
   return !path.empty() && ::stat(path.c_str(), &st) == 0;
 }
 
-std::optional<FileContents> NSFileManager::contentsOfRegularFile(const std::string& path,
-                                                                 size_t maxSize,
-                                                                 std::string_view kind,
-                                                                 std::string* error) const {
-  int fd = -1;
-  auto fail = [&](std::string reason) -> std::optional<FileContents> {
-    if (fd >= 0) ::close(fd);
-    if (error) *error = path + ": " + reason;
-    return std::nullopt;
-  };
-  auto failErrno = [&](const char* what) {
-    return fail(std::string(what) + ": " + std::strerror(errno));
-  };
-  // O_NONBLOCK: opening a FIFO must not wait for a writer; it is refused below.
-  fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
-  if (fd < 0) return failErrno("cannot open");
-  struct stat st {};
-  if (::fstat(fd, &st) != 0) return failErrno("cannot stat");
-  if (!S_ISREG(st.st_mode)) return fail("not a regular file");
-  if (static_cast<uint64_t>(st.st_size) > maxSize) {
-    return fail(std::to_string(st.st_size) + " bytes is larger than the " +
-                std::to_string(maxSize) + "-byte limit for a " + std::string(kind));
-  }
-  // One byte of room beyond the size seen, to notice a file that grew.
-  const size_t size = static_cast<size_t>(st.st_size);
-  FileContents file{std::make_unique_for_overwrite<uint8_t[]>(size + 1), 0};
-  while (file.size < size + 1) {
-    const size_t asked = size + 1 - file.size;
-    ssize_t n = ::read(fd, file.data.get() + file.size, asked);
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return failErrno("cannot read");
-    if (n == 0) break;
-    file.size += static_cast<size_t>(n);
-    // A read of a regular file that stops short at the size seen has reached
-    // its end: the file is read in one call.
-    if (static_cast<size_t>(n) < asked && file.size == size) break;
-  }
-  if (file.size > size) return fail("changed while being read");
-  ::close(fd);
-  return file;
-}
-
 std::string_view fileKindName(unsigned mode) {
   switch (mode & S_IFMT) {
     case S_IFDIR:
@@ -98,36 +57,101 @@ std::string_view fileKindName(unsigned mode) {
   }
 }
 
-std::optional<std::string> readSmallFile(const std::string& path, size_t maxSize, std::string* why,
-                                         int* err) {
+int writeAll(int fd, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t n = ::write(fd, bytes.data(), bytes.size());
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) return errno;
+    bytes.remove_prefix(static_cast<size_t>(n));
+  }
+  return 0;
+}
+
+int replaceFile(const std::filesystem::path& path, std::string_view bytes, unsigned newMode,
+                std::string* step) {
+  std::filesystem::path dir = path.parent_path();
+  if (dir.empty()) dir = ".";
+  std::string temporary = (dir / ("." + path.filename().string() + ".XXXXXX")).string();
+  const int fd = ::mkostemp(temporary.data(), O_CLOEXEC);
+  if (fd < 0) {
+    *step = "cannot create a file in " + dir.string() + " to replace it with";
+    return errno;
+  }
+  int err = 0;
+  struct stat old {};
+  *step = "cannot give the new file the old one's mode";
+  if (::stat(path.c_str(), &old) == 0) {
+    if (::fchmod(fd, old.st_mode & 07777) != 0) err = errno;
+    if (!err && ::geteuid() == 0 && ::fchown(fd, old.st_uid, old.st_gid) != 0) err = errno;
+  } else {
+    // mkostemp makes the file private; a new one gets the mode asked for.
+    const mode_t mask = ::umask(0);
+    ::umask(mask);
+    if (::fchmod(fd, newMode & ~mask) != 0) err = errno;
+  }
+  if (!err && (err = writeAll(fd, bytes))) *step = "cannot write the new file";
+  if (!err && ::fsync(fd) != 0) err = errno, *step = "cannot sync the new file";
+  if (::close(fd) != 0 && !err) err = errno, *step = "cannot close the new file";
+  if (!err && ::rename(temporary.c_str(), path.c_str()) != 0)
+    err = errno, *step = "cannot rename the new file over it";
+  if (err) {
+    ::unlink(temporary.c_str());
+    return err;
+  }
+  // The rename itself is durable only once the directory is synced.
+  const int dfd = ::open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (dfd < 0 || ::fsync(dfd) != 0) err = errno, *step = "cannot sync its directory";
+  if (dfd >= 0) ::close(dfd);
+  return err;
+}
+
+std::optional<FileContents> readRegularFile(const std::string& path, size_t maxSize,
+                                            FileError* error) {
   int fd = -1;
-  auto fail = [&](int code, std::string reason) -> std::optional<std::string> {
+  auto fail = [&](int code, std::string reason) -> std::optional<FileContents> {
     if (fd >= 0) ::close(fd);
-    if (why) *why = std::move(reason);
-    if (err) *err = code;
+    if (error) *error = {code, std::move(reason)};
     return std::nullopt;
   };
+  auto failErrno = [&](const char* what) {
+    return fail(errno, what + std::string(std::strerror(errno)));
+  };
+  // O_NONBLOCK: opening a FIFO must not wait for a writer; it is refused below.
   fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
-  if (fd < 0) return fail(errno, std::string("cannot open: ") + std::strerror(errno));
+  if (fd < 0) return failErrno("cannot open: ");
   struct stat st {};
-  if (::fstat(fd, &st) != 0)
-    return fail(errno, std::string("cannot stat: ") + std::strerror(errno));
+  if (::fstat(fd, &st) != 0) return failErrno("cannot stat: ");
   if (!S_ISREG(st.st_mode))
     return fail(EINVAL, "not a regular file (" + std::string(fileKindName(st.st_mode)) + ")");
   const std::string limit = "larger than the " + std::to_string(maxSize) + "-byte limit";
-  if (static_cast<uint64_t>(st.st_size) > maxSize) return fail(EFBIG, limit);
-  std::string out;
-  char buffer[8192];
+  const auto size = static_cast<uint64_t>(st.st_size);
+  if (size > maxSize) return fail(EFBIG, std::to_string(size) + " bytes is " + limit);
+  // One byte of room beyond the size seen, so that the read of the whole file
+  // stops short and ends it; a file that claims no size (under /proc or /sys)
+  // gets a page to start with.
+  size_t room = size ? static_cast<size_t>(size) + 1 : std::min<size_t>(4096, maxSize + 1);
+  FileContents file{std::make_unique_for_overwrite<uint8_t[]>(room), 0};
   for (;;) {
-    ssize_t n = ::read(fd, buffer, sizeof buffer);
+    // Full, but not yet beyond maxSize (checked after each read): grow.
+    if (file.size == room) {
+      const size_t grown = std::min(room * 2, maxSize + 1);
+      auto data = std::make_unique_for_overwrite<uint8_t[]>(grown);
+      std::memcpy(data.get(), file.data.get(), file.size);
+      file.data = std::move(data);
+      room = grown;
+    }
+    const size_t asked = room - file.size;
+    const ssize_t n = ::read(fd, file.data.get() + file.size, asked);
     if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return fail(errno, std::string("cannot read: ") + std::strerror(errno));
+    if (n < 0) return failErrno("cannot read: ");
     if (n == 0) break;
-    if (static_cast<size_t>(n) > maxSize - out.size()) return fail(EFBIG, limit);
-    out.append(buffer, static_cast<size_t>(n));
+    file.size += static_cast<size_t>(n);
+    if (file.size > maxSize) return fail(EFBIG, limit);
+    // A read that stops short at the size seen has reached the end.
+    if (size && static_cast<size_t>(n) < asked && file.size == size) break;
   }
   ::close(fd);
-  return out;
+  return file;
 }
 
 }  // namespace kolvrand

@@ -24,6 +24,15 @@ struct FileContents {
   std::unique_ptr<uint8_t[]> data;
   size_t size = 0;
   std::span<const uint8_t> bytes() const { return {data.get(), size}; }
+  std::string text() const { return {reinterpret_cast<const char*>(data.get()), size}; }
+};
+
+// Why a file could not be read: an errno value (EINVAL for what is not a
+// regular file, EFBIG for one too large) and the reason in words, without the
+// path ("not a regular file (a FIFO)", "cannot open: Permission denied").
+struct FileError {
+  int code = 0;
+  std::string reason;
 };
 
 class NSFileManager {
@@ -36,29 +45,32 @@ class NSFileManager {
                                        const NSURL* appropriateForURL, bool create,
                                        std::string* error) const;
   bool fileExistsAtPath(const std::string& path) const;
-  // The whole regular file at `path` in one read. nullopt with *error set
-  // ("PATH: REASON") when it cannot be opened, stated or read, is not a
-  // regular file (a FIFO is refused without waiting for a writer), is larger
-  // than `maxSize` (the message names the limit as that of a `kind`), or
-  // grew while being read.
-  std::optional<FileContents> contentsOfRegularFile(const std::string& path, size_t maxSize,
-                                                    std::string_view kind,
-                                                    std::string* error) const;
 };
 
 // What stands at a path that is not a regular file, for messages: "a
 // directory", "a FIFO", "a character device", "a block device", "a socket".
 std::string_view fileKindName(unsigned mode);
 
-// A small file whole (settings, a device description, JSON written by hand),
-// so that no file can block its reader or claim its memory: opened without
-// waiting (a FIFO is refused, never waited on), a regular file only (a link to
-// /dev/zero is a character device), and at most `maxSize` bytes, counted as
-// read since /proc and sysfs files claim a size of 0. nullopt on failure, with
-// *why the reason without the path ("not a regular file (a FIFO)", "larger
-// than the 1048576-byte limit", "cannot open: Permission denied") and *err an
-// errno value (EINVAL for what is not a regular file, EFBIG for too large).
-std::optional<std::string> readSmallFile(const std::string& path, size_t maxSize,
-                                         std::string* why = nullptr, int* err = nullptr);
+// Writes all of `bytes` to `fd`, going on after a short write or an
+// interrupted one; 0, or an errno value.
+int writeAll(int fd, std::string_view bytes);
+
+// Replaces the file at `path` whole with `bytes`, so that a reader sees the
+// old content or the new, and the new survives a crash once this returns 0:
+// a temporary file beside it (.NAME.XXXXXX), fsync, rename over it, fsync of
+// the directory. The new file keeps the mode (and, for root, the owner) of
+// the one it replaces; a file made anew gets `newMode` less the umask. 0, or
+// an errno value with *step naming the step that failed.
+int replaceFile(const std::filesystem::path& path, std::string_view bytes, unsigned newMode,
+                std::string* step);
+
+// The whole regular file at `path`, so that no file can block its reader or
+// claim its memory: opened without waiting (a FIFO is refused, never waited
+// on), a regular file only (a link to /dev/zero is a character device), and
+// at most `maxSize` bytes, counted as read since /proc and sysfs files claim a
+// size of 0. A file whose size is known is read in one call. nullopt with
+// *error on failure.
+std::optional<FileContents> readRegularFile(const std::string& path, size_t maxSize,
+                                            FileError* error = nullptr);
 
 }  // namespace kolvrand

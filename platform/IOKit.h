@@ -10,7 +10,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Value.h"
+#include "base/Value.h"
 
 namespace kolvrand {
 

@@ -23,6 +23,7 @@
 #include <mutex>
 #include <vector>
 
+#include "base/Hex.h"
 #include "platform/Backend.h"
 #include "platform/IOKit.h"
 #include "platform/Internal.h"

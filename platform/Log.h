@@ -5,19 +5,16 @@
 // enabled for its log.
 #pragma once
 
-#include <concepts>
 #include <cstdint>
 #include <memory>
-#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
-#include <type_traits>
-#include <variant>
+
+#include "base/Format.h"
+#include "base/LogLevels.h"
 
 namespace kolvrand {
-
-enum class LogLevel : uint8_t { Error = 0, Default = 1, Debug = 2 };
 
 // Where formatted messages go. The default sink is chosen once per process:
 // journald when stderr is the journal, else one line per message on stderr.
@@ -59,68 +56,6 @@ class OSLog {
 using os_log_t = std::shared_ptr<const OSLog>;
 
 os_log_t os_log_create(const char* subsystem, const char* category);
-
-// One formatting argument. Objects are carried by their description, taken
-// only when the message is enabled.
-struct LogArg {
-  struct Object {
-    std::optional<std::string> text;  // nullopt prints "(null)"
-  };
-  std::variant<int64_t, uint64_t, double, const void*, const char*, std::string_view, Object> v;
-};
-
-template <typename T>
-concept Describable = requires(const T& t) {
-  { t.description() } -> std::convertible_to<std::string>;
-};
-
-// A smart pointer to a describable object (a nil one prints "(null)").
-template <typename T>
-concept DescribablePointer = requires(const T& p) {
-  p.get();
-  { p->description() } -> std::convertible_to<std::string>;
-};
-
-template <typename T>
-LogArg makeLogArg(const T& a) {
-  using U = std::remove_cvref_t<T>;
-  if constexpr (std::is_same_v<U, bool>) {
-    return {int64_t{a}};
-  } else if constexpr (std::is_integral_v<U> && std::is_signed_v<U>) {
-    return {int64_t{a}};
-  } else if constexpr (std::is_integral_v<U>) {
-    return {uint64_t{a}};
-  } else if constexpr (std::is_enum_v<U>) {
-    return {static_cast<int64_t>(a)};
-  } else if constexpr (std::is_floating_point_v<U>) {
-    return {double{a}};
-  } else if constexpr (std::is_same_v<U, const char*> || std::is_same_v<U, char*>) {
-    return {static_cast<const char*>(a)};
-  } else if constexpr (std::is_array_v<U>) {
-    return {static_cast<const char*>(a)};
-  } else if constexpr (std::is_same_v<U, std::string> || std::is_same_v<U, std::string_view>) {
-    return {std::string_view(a)};
-  } else if constexpr (std::is_same_v<U, std::nullptr_t>) {
-    return {LogArg::Object{}};
-  } else if constexpr (std::is_same_v<U, std::optional<std::string>>) {
-    return {LogArg::Object{a}};
-  } else if constexpr (Describable<U>) {
-    return {LogArg::Object{std::string(a.description())}};
-  } else if constexpr (DescribablePointer<U>) {
-    return a ? LogArg{LogArg::Object{std::string(a->description())}} : LogArg{LogArg::Object{}};
-  } else if constexpr (std::is_pointer_v<U>) {
-    return {static_cast<const void*>(a)};
-  } else {
-    static_assert(sizeof(U) == 0, "unsupported log argument");
-  }
-}
-
-// Formats `format` with printf semantics for the conversions d i u x X o c s p
-// f e g %, with the length modifiers hh h l ll j z t, flags, width and
-// precision; %@ prints an object (or a string) and "(null)" for nil; %s of a
-// null C string prints "(null)". A conversion without a matching argument
-// prints nothing; surplus arguments are ignored.
-std::string formatLogMessage(std::string_view format, std::span<const LogArg> args);
 
 // Formats and hands the message to the sink; callers have checked the level.
 void emitLog(const OSLog& log, LogLevel level, std::string_view format,

@@ -13,7 +13,8 @@
 #include <cstdlib>
 #include <mutex>
 
-#include "platform/Utf8.h"
+#include "base/Utf8.h"
+#include "platform/FileManager.h"
 
 namespace kolvrand {
 
@@ -50,17 +51,7 @@ void writeStderrLine(LogLevel level, std::string_view category, std::string_view
   line += visibleText(withoutTrailingNewline(message));
   line += '\n';
   std::lock_guard lock(*mutex);
-  const char* p = line.data();
-  size_t left = line.size();
-  while (left > 0) {
-    ssize_t n = ::write(STDERR_FILENO, p, left);
-    if (n < 0) {
-      if (errno == EINTR) continue;
-      return;
-    }
-    p += n;
-    left -= static_cast<size_t>(n);
-  }
+  writeAll(STDERR_FILENO, line);  // a log that cannot be written has nowhere to say so
 }
 
 class StderrSink final : public LogSink {

@@ -8,12 +8,12 @@
 
 #include <string>
 
+#include "base/CommonCrypto.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/KextBatteryModel.h"
 #include "pipeline/PBStreamReader.h"
 #include "pipeline/PBStreamWriter.h"
-#include "platform/CommonCrypto.h"
 #include "tests/support/TestDevice.h"
 
 namespace kolvrand {

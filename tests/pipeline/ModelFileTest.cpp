@@ -115,7 +115,7 @@ TEST(PBStreamReader, FramingErrorsSayWhere) {
       {one + "\x81\x80", std::nullopt, "the length of message 1 at offset 5 is cut short"},
       {"\x05\x90\x01", std::nullopt,
        "message 0 at offset 0 claims 5 bytes but only 2 remain in the file"},
-      {std::string("\xff\xff\xff\xff\xff\xff\xff\xff\xff\x7f", 10), std::nullopt,
+      {std::string(10, '\xff'), std::nullopt,
        "the length of message 0 at offset 0 is not a valid varint"},
       {one + "\x02\x90\x80", std::nullopt, "message 1 at offset 5 could not be decoded"},
   };

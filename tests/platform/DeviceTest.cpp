@@ -6,7 +6,7 @@
 #include <cerrno>
 #include <sstream>
 
-#include "platform/CommonCrypto.h"
+#include "base/CommonCrypto.h"
 #include "platform/Defaults.h"
 #include "platform/IOKit.h"
 #include "platform/Sysctl.h"

@@ -16,9 +16,9 @@
 #include <map>
 #include <mutex>
 
+#include "base/CommonCrypto.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/KextBatteryModel.h"
-#include "platform/CommonCrypto.h"
 #include "tests/support/TestDevice.h"
 
 namespace kolvrand {

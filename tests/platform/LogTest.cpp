@@ -7,8 +7,8 @@
 #include <set>
 #include <thread>
 
+#include "base/Value.h"
 #include "platform/Log.h"
-#include "platform/Value.h"
 #include "tests/support/TestDevice.h"
 
 namespace kolvrand {
@@ -24,31 +24,22 @@ std::vector<LogArg> args(const T&... a) {
 TEST(FormatLogMessage, MatchesPrintf) {
   const char* nullText = nullptr;
   const std::string hi = "hi";  // LogArg views it: it must outlive the table
-  // long, size_t and ptrdiff_t are as wide as the target's: 32 bits on armhf.
-  char widths[96];
-  std::snprintf(widths, sizeof widths, "%lx %llx %jx %zx %tx", -1L, -1LL, intmax_t{-1}, size_t(-1),
-                ptrdiff_t{-1});
+  // long and size_t are as wide as the target's: 32 bits on armhf.
+  char widths[64];
+  std::snprintf(widths, sizeof widths, "%lx %zx", -1L, size_t(-1));
   const std::tuple<const char*, std::vector<LogArg>, std::string> cases[] = {
-      {"%d|%i", args(-5, 17), "-5|17"},
-      {"[%5d|%-5d|%05d]", args(42, 42, -42), "[   42|42   |-0042]"},
-      {"%+d % d", args(7, 7), "+7  7"},
-      {"%x %X %o %#x %#o", args(0x1ff, 0xabc, 8, 255, 8), "1ff ABC 10 0xff 010"},
+      {"%d|%i|%5d|%-3d|%04x", args(-5, 17, 42, 7, 0x1f), "-5|17|   42|7  |001f"},
       // The length modifier narrows the argument as C's va_arg would.
-      {"%hhx %hx %hhd %hd", args(0x1ff, 0x12345, 255, 65535), "ff 2345 -1 -1"},
-      {"%x %u %d", args(-1, -1, 0xffffffffu), "ffffffff 4294967295 -1"},
-      {"%lx %llx %jx %zx %tx", args(-1L, -1LL, -1L, size_t(-1), -1L), widths},
-      {"%lld %llu %qd %Lf", args(LLONG_MIN, ULLONG_MAX, 5, 1.5),
-       "-9223372036854775808 18446744073709551615 5 1.500000"},
-      // Floating-point arguments to integer conversions truncate and saturate.
-      {"%d %d %u %llu %lld", args(2.9, NAN, -1.0, 1e30, -1e30),
-       "2 0 4294967295 18446744073709551615 -9223372036854775808"},
-      {"%c%c", args('o', 'k'), "ok"},
+      {"%x %u %d %hhx", args(-1, -1, 0xffffffffu, 0x1ff), "ffffffff 4294967295 -1 ff"},
+      {"%lx %zx", args(-1L, size_t(-1)), widths},
+      {"0x%lx %llu", args(uint64_t{0x2168}, ULLONG_MAX), "0x2168 18446744073709551615"},
+      // An argument of another kind than the directive's is converted, never
+      // read as something it is not.
+      {"%d %d %s %s %.1f", args(2.9, hi, 7, 1.5, "y"), "2 0 7 1.5 0.0"},
       {"%s|%.2s|%5s|%-4s|", args("hello", "hello", "hi", hi), "hello|he|   hi|hi  |"},
-      {"%s %s %s %s %s", args(nullText, 7, 8u, 1.5, reinterpret_cast<const void*>(0x10)),
-       "(null) 7 8 1.5 0x10"},
-      {"%@ %@ %@", args(nullptr, std::string_view("str"), std::optional<std::string>()),
-       "(null) str (null)"},
-      {"%@", args(Value(Dictionary{{"a", Value(Number::fromSigned(1))}})), "{\"a\": 1}"},
+      {"%s %@ %@ %@",
+       args(nullText, nullptr, std::string_view("str"), std::optional<std::string>()),
+       "(null) (null) str (null)"},
       {"%@", args(std::shared_ptr<Value>()), "(null)"},
       {"%@",
        args(Value(Dictionary{
@@ -58,23 +49,14 @@ TEST(FormatLogMessage, MatchesPrintf) {
                              Value(Number::fromDouble(-1e300)), Value(Number::fromDouble(NAN)),
                              Value(Number::fromFloat(-INFINITY))})}})),
        R"({"s": "q\"\\\n\t\u0001", "d": <00ab>, "l": [true, false, 0.5, -1e+300, nan, -inf]})"},
-      {"%.3f %e %g %g", args(3.14159, 12345.678, 0.0001, 1e20), "3.142 1.234568e+04 0.0001 1e+20"},
-      {"%5.1f|%-9.2e|%.1f|%.1f", args(3.14159, 1.5, 3u, "x"), "  3.1|1.50e+00 |3.0|0.0"},
-      {"%f", args(2), "2.000000"},
-      {"%p", args(reinterpret_cast<const void*>(0x1234)), "0x1234"},
-      {"100%% %d%%", args(5), "100% 5%"},
-      // A negative * width left-aligns, a negative * precision is none.
-      {"%*d|%-*d|%.*s|%*d|%.*s", args(4, 7, 3, 7, 2, "abc", -3, 7, -1, "abc"),
-       "   7|7  |ab|7  |abc"},
-      // Fields wider than printf's buffer, and beyond the bound of 4096.
-      {"%300d|%99999d", args(1, 2), std::string(299, ' ') + "1|" + std::string(4095, ' ') + "2"},
-      {"%{public}s <Error> %{private}d %{open", args("m", 3), "m <Error> 3 %{open"},
-      // Missing arguments print nothing; surplus ones are ignored; %n writes
-      // nothing.
-      {"%d and %d.", args(1), "1 and ."},
-      {"%d %s%n", args(1, "x", nullText, "surplus"), "1 x"},
-      {"trailing %", {}, "trailing %"},
-      {"%k %5.", {}, "%k %5."},
+      {"%.3f %g %c%c %p", args(3.14159, 1e20, 'o', 'k', reinterpret_cast<const void*>(0x10)),
+       "3.142 1e+20 ok 0x10"},
+      // Missing arguments print nothing, surplus ones are ignored; a field
+      // wider than the bound, an unknown conversion and a cut-off directive
+      // print as they stand.
+      {"100%% %d%% %d.", args(5), "100% 5% ."},
+      {"%d %s", args(1, "x", "surplus"), "1 x"},
+      {"%300d|%99999d|%k|%5", args(1, 2), std::string(299, ' ') + "1|%99999d|%k|%5"},
   };
   for (const auto& [format, arguments, expected] : cases)
     EXPECT_EQ(formatLogMessage(format, arguments), expected) << "format: " << format;

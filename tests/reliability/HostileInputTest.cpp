@@ -29,7 +29,7 @@
 
 #include <regex>
 
-#include "platform/Utf8.h"
+#include "base/Utf8.h"
 #include "tests/support/ExampleDevice.h"
 
 namespace kolvrand::test {

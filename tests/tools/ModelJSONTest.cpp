@@ -90,31 +90,6 @@ TEST(ModelJSON, RandomModelsRoundTrip) {
   }
 }
 
-// Every unsigned 32-bit integer, in any spelling JSON has for it (a
-// fraction of zeros, an exponent, digits moved across the point), is taken
-// at its exact value, which a double or a float would not keep.
-TEST(ModelJSON, IntegersKeepTheirExactValueInEverySpelling) {
-  std::mt19937_64 rng(5640);
-  for (int i = 0; i < 2000; ++i) {
-    const uint32_t value = i < 2 ? (i ? UINT32_MAX : 0) : static_cast<uint32_t>(rng());
-    const std::string digits = std::to_string(value);
-    const size_t point = rng() % digits.size() + 1;  // digits before the point
-    const std::string spellings[] = {
-        digits + ".0",
-        digits + "e0",
-        value ? digits + "00E-2" : "0.00E+2",
-        digits.substr(0, point) + "." + digits.substr(point) + "0e" +
-            std::to_string(digits.size() - point),
-    };
-    for (const std::string& spelling : spellings) {
-      JSONError error;
-      auto models = modelsFromJSON("{\"chemID\": " + spelling + "}", true, &error);
-      ASSERT_TRUE(models) << spelling << ": " << error.message();
-      EXPECT_EQ((*models)[0]->chemID(), value) << spelling;
-    }
-  }
-}
-
 // What comes of each JSON text: the model, as decode shows it again (for an
 // empty `path`), or the path of the first wrong value and why.
 TEST(ModelJSON, EachTextGivesItsModelOrThePathOfTheFirstWrongValue) {

@@ -9,10 +9,10 @@
 #include <regex>
 #include <thread>
 
+#include "base/CommonCrypto.h"
 #include "daemon/BatteryModelTask.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/DaemonIdentifier.h"
-#include "platform/CommonCrypto.h"
 #include "tests/support/ModelFiles.h"
 #include "tests/support/TestDevice.h"
 #include "tests/tools/RunTool.h"
@@ -270,7 +270,7 @@ TEST_F(Rcmodel, StatusAndRecordAgreeWithTheDaemon) {
   fs::create_directory(model);
   EXPECT_EQ(verdict(), "missing") << report;
   EXPECT_EQ(field("model file exists"), "no, not a regular file");
-  EXPECT_TRUE(matches(report, ": not a regular file\n")) << report;
+  EXPECT_TRUE(matches(report, ": not a regular file \\(a directory\\)\n")) << report;
   fs::remove(model);
 
   // A model the record builder refuses, with the builder's reason.

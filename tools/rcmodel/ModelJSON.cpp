@@ -9,6 +9,7 @@
 #include <limits>
 #include <nlohmann/json.hpp>
 
+#include "base/Utf8.h"
 #include "model/OTAParamRC.h"
 
 namespace kolvrand::rcmodel {
@@ -140,6 +141,8 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
   // Where the text is one line of several (JSON Lines): its number, for the
   // parser's locations, which count from the slice it was given.
   size_t line = 1;
+  // The text being parsed, to place a syntax error in.
+  std::string_view slice;
   // Set to a value's path to find the number there as written; nothing is
   // kept then, and the parse ends once it is found.
   std::optional<std::string> wantedPath;
@@ -229,25 +232,21 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
   bool start_array(std::size_t) override { return open(Value(Array())); }
   bool end_array() override { return close(); }
 
-  bool parse_error(std::size_t, const std::string&, const nlohmann::detail::exception& e) override {
-    // The library's text, without its "[json.exception.parse_error.101] ".
-    std::string what = e.what();
-    if (what.starts_with("[json.exception.")) {
-      if (auto at = what.find("] "); at != std::string::npos) what = what.substr(at + 2);
-    }
-    // "parse error at line 1, column 4: ..." counts from the line given.
-    constexpr std::string_view kAtLine = "at line ";
-    if (auto at = what.find(kAtLine); at != std::string::npos && line > 1) {
-      const size_t digits = at + kAtLine.size();
-      const size_t end = what.find(',', digits);
-      if (end != std::string::npos) {
-        const size_t inSlice = std::strtoul(what.c_str() + digits, nullptr, 10);
-        what.replace(digits, end - digits, std::to_string(line - 1 + inSlice));
-      }
-    }
-    // A second value after the first (objects one after the other, printed
-    // over several lines each) is the likeliest cause.
-    if (what.find("expected end of input") != std::string::npos)
+  // The library's words change between its versions: only where it stopped
+  // is taken from it (the count of the bytes it read, the stray byte the
+  // last), said as a line and column of the whole text.
+  bool parse_error(std::size_t read, const std::string& token,
+                   const nlohmann::detail::exception&) override {
+    const std::string_view before = slice.substr(0, read ? std::min(read - 1, slice.size()) : 0);
+    const size_t lastLineFeed = before.rfind('\n');
+    const size_t column =
+        lastLineFeed == std::string_view::npos ? before.size() + 1 : before.size() - lastLineFeed;
+    std::string what =
+        "at line " + std::to_string(line + static_cast<size_t>(std::ranges::count(before, '\n'))) +
+        ", column " + std::to_string(column) + ": syntax error at \"" + visibleText(token) + "\"";
+    // A second value after a whole first one (objects one after the other,
+    // printed over several lines each) is the likeliest cause.
+    if (complete_)
       what +=
           "; several models are read as an array of objects or as one object a line "
           "(JSON Lines, as rcmodel decode prints them)";
@@ -278,6 +277,7 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
   bool add(Value value) {
     if (++items > maxItems) return fail(tooMany);
     if (frames_.empty()) {
+      complete_ = true;
       if (!wantedPath) root = std::move(value);
       return true;
     }
@@ -319,6 +319,7 @@ class ValueBuilder : public nlohmann::json_sax<JSON> {
   }
 
   std::vector<Frame> frames_;
+  bool complete_ = false;  // a whole value has been read
 };
 
 }  // namespace
@@ -401,6 +402,7 @@ bool isJSONLines(std::string_view text) {
 
 std::optional<Value> parseJSON(std::string_view text, JSONError* error) {
   ValueBuilder builder;
+  builder.slice = text;
   if (!JSON::sax_parse(text, &builder) || !builder.root) {
     if (error) *error = builder.error;
     return std::nullopt;
@@ -489,6 +491,7 @@ bool forEachModelInJSON(std::string_view text, bool single, const ModelBudget& b
       first = false;
       ValueBuilder builder;
       builder.line = number;
+      builder.slice = line;
       prepare(builder);
       if (!JSON::sax_parse(line, &builder) || !builder.root) {
         // A syntax error names its line in the text.
@@ -518,6 +521,7 @@ bool forEachModelInJSON(std::string_view text, bool single, const ModelBudget& b
       return true;
     };
   }
+  builder.slice = text;
   if (!JSON::sax_parse(text, &builder) || !builder.root) {
     if (error) *error = builder.error;
     return false;

@@ -13,7 +13,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Value.h"
+#include "base/Value.h"
 
 namespace kolvrand {
 class OTAParamRC;

@@ -18,6 +18,7 @@
 #include <filesystem>
 #include <optional>
 
+#include "platform/FileManager.h"
 #include "tools/rcmodel/Tool.h"
 
 namespace kolvrand::rcmodel {
@@ -25,16 +26,6 @@ namespace kolvrand::rcmodel {
 namespace {
 
 namespace fs = std::filesystem;
-
-bool writeAll(int fd, std::string_view bytes) {
-  while (!bytes.empty()) {
-    ssize_t n = ::write(fd, bytes.data(), bytes.size());
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return false;
-    bytes.remove_prefix(static_cast<size_t>(n));
-  }
-  return true;
-}
 
 // The descriptor that /dev/fd/N, /proc/self/fd/N or /proc/thread-self/fd/N
 // names, or -1. Opening such a path would open the file anew at offset 0 and,
@@ -71,48 +62,11 @@ fs::path finalTarget(fs::path path, int* err, int* fd) {
   return path;
 }
 
-// Replaces `target` with a file holding `bytes`, keeping the mode (and, for
-// root, the owner) of the file it replaces; 0, or an errno value with *step
-// naming the step that failed.
-int replaceFile(const fs::path& target, std::string_view bytes, std::string* step) {
-  fs::path dir = target.parent_path();
-  if (dir.empty()) dir = ".";
-  std::string name = ".";
-  name += target.filename().string();
-  name += ".XXXXXX";
-  std::string temporary = (dir / name).string();
-  const int fd = ::mkstemp(temporary.data());
-  if (fd < 0) {
-    *step = "cannot create a file in " + dir.string() + " to replace it with";
-    return errno;
-  }
-
-  int err = 0;
-  struct stat old {};
-  *step = "cannot give the new file the old one's mode";
-  if (::stat(target.c_str(), &old) == 0) {
-    if (::fchmod(fd, old.st_mode & 07777) != 0) err = errno;
-    if (!err && ::geteuid() == 0 && ::fchown(fd, old.st_uid, old.st_gid) != 0) err = errno;
-  } else {
-    // mkstemp makes the file private; a new output file gets the usual mode.
-    const mode_t mask = ::umask(0);
-    ::umask(mask);
-    if (::fchmod(fd, 0666 & ~mask) != 0) err = errno;
-  }
-  if (!err && !writeAll(fd, bytes)) err = errno, *step = "cannot write the new file";
-  if (!err && ::fsync(fd) != 0) err = errno, *step = "cannot sync the new file";
-  if (::close(fd) != 0 && !err) err = errno, *step = "cannot close the new file";
-  if (!err && ::rename(temporary.c_str(), target.c_str()) != 0)
-    err = errno, *step = "cannot rename the new file over it";
-  if (err) ::unlink(temporary.c_str());
-  return err;
-}
-
 // Writes into what is already at `path`, without creating or truncating.
 int writeInPlace(const std::string& path, std::string_view bytes) {
   const int fd = ::open(path.c_str(), O_WRONLY | O_NOCTTY | O_CLOEXEC);
   if (fd < 0) return errno;
-  int err = writeAll(fd, bytes) ? 0 : errno;
+  int err = writeAll(fd, bytes);
   if (::close(fd) != 0 && !err) err = errno;
   return err;
 }
@@ -136,8 +90,8 @@ bool writeOutput(const std::string& command, const std::string& path, std::strin
   int err = 0, fd = -1;
   const fs::path target = finalTarget(path, &err, &fd);
   if (fd >= 0) {
-    if (!writeAll(fd, bytes)) {
-      error(command, path + ": cannot write: " + std::strerror(errno));
+    if (int err = writeAll(fd, bytes)) {
+      error(command, path + ": cannot write: " + std::strerror(err));
       return false;
     }
     return true;
@@ -160,7 +114,7 @@ bool writeOutput(const std::string& command, const std::string& path, std::strin
     return true;
   }
   std::string step = "cannot write";
-  if (!err) err = replaceFile(target, bytes, &step);
+  if (!err) err = replaceFile(target, bytes, 0666, &step);
   if (err) {
     error(command, path + ": " + step + ": " + std::strerror(err) + "; it was left as it was");
     return false;

@@ -7,11 +7,11 @@
 #include <cstdio>
 #include <span>
 
+#include "base/Utf8.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/KextBatteryModel.h"
 #include "pipeline/KextBatteryModelSources.h"
-#include "platform/Utf8.h"
 #include "tools/rcmodel/ModelJSON.h"
 #include "tools/rcmodel/Tool.h"
 

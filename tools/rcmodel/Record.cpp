@@ -2,11 +2,11 @@
 // rcmodel record: the record the daemon would send for a model file.
 #include <cstdio>
 
+#include "base/CommonCrypto.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "pipeline/KextBatteryModel.h"
-#include "platform/CommonCrypto.h"
 #include "tools/rcmodel/Tool.h"
 
 namespace kolvrand::rcmodel {

@@ -8,15 +8,15 @@
 #include <filesystem>
 #include <mutex>
 
+#include "base/CommonCrypto.h"
+#include "base/Utf8.h"
 #include "daemon/BatteryModelTask.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/DaemonIdentifier.h"
 #include "pipeline/KextBatteryModel.h"
 #include "platform/Backend.h"
-#include "platform/CommonCrypto.h"
 #include "platform/Defaults.h"
-#include "platform/Utf8.h"
 #include "tools/rcmodel/Tool.h"
 
 namespace kolvrand::rcmodel {

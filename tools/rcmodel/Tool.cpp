@@ -12,11 +12,11 @@
 #include <filesystem>
 #include <span>
 
+#include "base/Utf8.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/PBStreamReader.h"
 #include "platform/FileManager.h"
 #include "platform/Log.h"
-#include "platform/Utf8.h"
 
 namespace kolvrand::rcmodel {
 
@@ -109,19 +109,18 @@ int usageError(const std::string& command, const std::string& message) {
 
 std::optional<std::string> readInput(const std::string& command, const std::string& path) {
   if (path == "-") return readStdin<std::string>(command, kMaxJSONSize, "JSON");
-  std::string why;
-  int err = 0;
-  auto text = readSmallFile(path, kMaxJSONSize, &why, &err);
-  if (!text) {
+  FileError why;
+  auto file = readRegularFile(path, kMaxJSONSize, &why);
+  if (!file) {
     const std::string limit = std::to_string(kMaxJSONSize) + "-byte limit";
-    error(command, path + ": " + why +
-                       (err == EFBIG    ? " for JSON; a model file's JSON needs far less"
-                        : err == EINVAL ? "; give a JSON file (of at most the " + limit +
-                                              "), or - to read standard input"
-                                        : "; check the file's path"));
+    error(command, path + ": " + why.reason +
+                       (why.code == EFBIG    ? " for JSON; a model file's JSON needs far less"
+                        : why.code == EINVAL ? "; give a JSON file (of at most the " + limit +
+                                                   "), or - to read standard input"
+                                             : "; check the file's path"));
     return std::nullopt;
   }
-  return text;
+  return file->text();
 }
 
 std::optional<std::vector<uint8_t>> readModelInput(const std::string& command,

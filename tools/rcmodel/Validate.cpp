@@ -3,13 +3,13 @@
 #include <cstdio>
 #include <span>
 
+#include "base/CommonCrypto.h"
+#include "base/Utf8.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/BatteryModelDataHandler.h"
 #include "pipeline/KextBatteryModel.h"
 #include "pipeline/KextBatteryModelSources.h"
 #include "pipeline/PBStreamReader.h"
-#include "platform/CommonCrypto.h"
-#include "platform/Utf8.h"
 #include "tools/rcmodel/Tool.h"
 #include "tools/rcmodel/WireCheck.h"
 

@@ -5,8 +5,9 @@
 // tags or varints of needless length as it finds them. The standard parser
 // (libprotobuf, protoc) rejects what such a file holds or reads it otherwise,
 // so a model that the daemon loads may not be the model its author sees with
-// protoc. This walks one encoded OTAParamRC as the daemon reads it and names
-// every such place.
+// protoc. This watches the daemon's own reader decode one OTAParamRC (as an
+// observer of that reader, so the two cannot disagree) and names every such
+// place.
 #pragma once
 
 #include <cstddef>

@@ -4,7 +4,7 @@
 // double the daemon's resident memory for one hash per boot. They are
 // deprecated in OpenSSL 3 in favour of EVP, which is why the warning is off.
 #define OPENSSL_SUPPRESS_DEPRECATED
-#include "platform/CommonCrypto.h"
+#include "base/CommonCrypto.h"
 
 namespace kolvrand {
 

@@ -10,9 +10,9 @@
 
 #include <nlohmann/json.hpp>
 
-#include "platform/Value.h"
+#include "base/Value.h"
 
-namespace kolvrand::platform {
+namespace kolvrand {
 
 using JSON = nlohmann::ordered_json;
 
@@ -22,4 +22,4 @@ std::optional<Value> valueFromJSON(const JSON& json, std::string* error = nullpt
 // The same from text; a syntax error is an error too.
 std::optional<Value> parseValueJSON(std::string_view text, std::string* error = nullptr);
 
-}  // namespace kolvrand::platform
+}  // namespace kolvrand

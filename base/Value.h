@@ -10,6 +10,8 @@
 #include <variant>
 #include <vector>
 
+#include "base/Hex.h"
+
 namespace kolvrand {
 
 class Value;
@@ -144,9 +146,6 @@ inline std::vector<Dictionary::Entry>::const_iterator Dictionary::begin() const 
 inline std::vector<Dictionary::Entry>::const_iterator Dictionary::end() const {
   return entries_.end();
 }
-
-// Lower-case hexadecimal, two digits a byte.
-std::string hexString(const uint8_t* bytes, size_t size);
 
 // How renderValue writes a value in JSON's shape: what stands between the
 // elements of an array or object and between a key and its value, what

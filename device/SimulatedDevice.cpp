@@ -13,12 +13,12 @@
 #include <set>
 #include <vector>
 
+#include "base/CommonCrypto.h"
+#include "base/ValueJSON.h"
 #include "platform/Backend.h"
-#include "platform/CommonCrypto.h"
 #include "platform/FileManager.h"
 #include "platform/IOKit.h"
 #include "platform/Internal.h"
-#include "platform/ValueJSON.h"
 
 namespace kolvrand::platform {
 
@@ -90,15 +90,17 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
     if (selector != kSetBatteryParamsSelector || input.size() != kBatteryParamsSize)
       return kIOReturnBadArgument;
     if (setParamsResult_ != 0) return setParamsResult_;
-    std::string error;
+    std::string step;
     std::error_code ec;
     std::filesystem::create_directories(paramsPath().parent_path(), ec);
-    if (ec ||
-        !writeFileAtomically(
-            paramsPath(),
-            std::string_view(reinterpret_cast<const char*>(input.data()), input.size()), &error)) {
+    const int err = ec ? 0
+                       : replaceFile(paramsPath(),
+                                     std::string_view(reinterpret_cast<const char*>(input.data()),
+                                                      input.size()),
+                                     0600, &step);
+    if (ec || err) {
       os_log_error(platformLog("device"), "simulated driver cannot keep the record: %s\n",
-                   ec ? ec.message() : error);
+                   ec ? ec.message() : step + ": " + std::strerror(err));
       return kIOReturnError;
     }
     return kIOReturnSuccess;
@@ -161,9 +163,9 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
   bool load(std::string* error) {
     // Read like the settings: never waiting on a FIFO, never more than a
     // device description can need.
-    std::string why;
-    auto text = readSmallFile((root_ / "device.json").string(), kMaxSmallFileSize, &why);
-    if (!text) return fail(error, "cannot read device.json: " + why);
+    FileError why;
+    auto text = readFile(root_ / "device.json", &why);
+    if (!text) return fail(error, "cannot read device.json: " + why.reason);
     JSON doc = JSON::parse(*text, nullptr, false);
     if (doc.is_discarded()) return fail(error, "device.json is not valid JSON");
     if (!doc.is_object()) return fail(error, "device.json is not an object");

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: MIT
-#include "platform/Value.h"
+#include "base/Value.h"
 
 #include <bit>
 #include <charconv>
@@ -161,17 +161,6 @@ bool Dictionary::operator==(const Dictionary& other) const {
     if (!o || !(*o == v)) return false;
   }
   return true;
-}
-
-std::string hexString(const uint8_t* bytes, size_t size) {
-  static constexpr char kDigits[] = "0123456789abcdef";
-  std::string out;
-  out.reserve(size * 2);
-  for (size_t i = 0; i < size; ++i) {
-    out += kDigits[bytes[i] >> 4];
-    out += kDigits[bytes[i] & 15];
-  }
-  return out;
 }
 
 void renderValue(std::string& out, const Value& value, const ValueTextStyle& style) {

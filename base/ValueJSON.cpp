@@ -1,11 +1,11 @@
 // SPDX-License-Identifier: MIT
-#include "platform/ValueJSON.h"
+#include "base/ValueJSON.h"
 
 #include <cstdint>
 
-#include "platform/Internal.h"
+#include "base/Hex.h"
 
-namespace kolvrand::platform {
+namespace kolvrand {
 
 namespace {
 
@@ -96,4 +96,4 @@ std::optional<Value> parseValueJSON(std::string_view text, std::string* error) {
   return valueFromJSON(j, error);
 }
 
-}  // namespace kolvrand::platform
+}  // namespace kolvrand
