@@ -18,9 +18,10 @@ KOLVRAND_SUITE=$(debian_suite)
 # Debian packages the build and the tests need (umockdev: its preload
 # library, which the host-registry tests load; libzstd-dev: trixie's static
 # libcrypto is linked with zstd).
+# systemd: journalctl, whose own parser reads the message catalog in a test.
 KOLVRAND_PACKAGES=(cmake ninja-build g++ clang pkg-config libssl-dev nlohmann-json3-dev libumockdev-dev
   umockdev libzstd-dev libsystemd-dev libgtest-dev libgmock-dev protobuf-compiler libprotobuf-dev
-  mandoc man-db libxml2-utils)
+  mandoc man-db libxml2-utils systemd)
 
 # release_package SUITE NAME...: each package's name in SUITE's archive, for
 # the names that differ between the releases the scripts run on; every
