@@ -12,6 +12,8 @@
  * announced with a change uevent like a real supply's.
  */
 
+#include <linux/bitops.h>
+#include <linux/ctype.h>
 #include <linux/device.h>
 #include <linux/kernel.h>
 #include <linux/module.h>
@@ -41,6 +43,9 @@ static bool ac_online = true;
 static struct power_supply *tesvar_battery;
 static struct power_supply *tesvar_ac;
 
+/* The supplies' names are the driver's: one device at a time may have them. */
+static unsigned long tesvar_battery_bound;
+
 static struct platform_device *tesvar_battery_pdev;
 
 static void tesvar_battery_changed_locked(void)
@@ -60,14 +65,27 @@ static bool tesvar_ac_online(void)
 	return online;
 }
 
+/*
+ * Decimal, or hexadecimal after "0x": never octal, whatever the leading
+ * zeros, and nothing else but the line feed "echo" ends its output with. A
+ * value refused leaves the parameter as it was.
+ */
 static int chem_id_set(const char *val, const struct kernel_param *kp)
 {
-	unsigned int id;
-	int ret;
+	unsigned int base = 10, id;
+	size_t digits;
 
-	ret = kstrtouint(val, 0, &id);
-	if (ret)
-		return ret;
+	if (val[0] == '0' && val[1] == 'x') {
+		base = 16;
+		val += 2;
+	}
+	digits = strspn(val, base == 16 ? "0123456789abcdefABCDEF" :
+				       "0123456789");
+	if (!digits || (val[digits] && strcmp(val + digits, "\n")))
+		return -EINVAL;
+	/* The digits are checked: only a value above 32 bits fails here. */
+	if (kstrtouint(val, base, &id))
+		return -EINVAL;
 
 	spin_lock(&tesvar_battery_lock);
 	chem_id = id;
@@ -92,15 +110,25 @@ static const struct kernel_param_ops chem_id_ops = {
 };
 module_param_cb(chem_id, &chem_id_ops, NULL, 0644);
 __MODULE_PARM_TYPE(chem_id, "uint");
-MODULE_PARM_DESC(chem_id, "battery chemistry ID (algo_chem_id), default 8552");
+MODULE_PARM_DESC(chem_id, "battery chemistry ID (algo_chem_id), decimal or 0x hex, default 8552");
 
+/*
+ * Printable ASCII only: the value goes out as it is in sysfs and in the
+ * uevent, where a line feed or a control byte would forge another line or
+ * variable. One final line feed, as "echo" writes it, is not part of it. A
+ * value refused leaves the parameter as it was.
+ */
 static int serial_number_set(const char *val, const struct kernel_param *kp)
 {
-	/* "echo SERIAL >" writes a line feed that is not part of it. */
-	size_t len = strcspn(val, "\n");
+	size_t len = strlen(val), i;
 
+	if (len && val[len - 1] == '\n')
+		len--;
 	if (len >= TESVAR_SERIAL_SIZE)
-		return -ENOSPC;
+		return -EINVAL;
+	for (i = 0; i < len; i++)
+		if (!isascii(val[i]) || !isprint(val[i]))
+			return -EINVAL;
 
 	spin_lock(&tesvar_battery_lock);
 	memcpy(serial_number, val, len);
@@ -126,7 +154,7 @@ static const struct kernel_param_ops serial_number_ops = {
 };
 module_param_cb(serial_number, &serial_number_ops, NULL, 0644);
 __MODULE_PARM_TYPE(serial_number, "string");
-MODULE_PARM_DESC(serial_number, "battery serial number, at most 31 characters");
+MODULE_PARM_DESC(serial_number, "battery serial number, at most 31 printable ASCII characters");
 
 static int ac_online_set(const char *val, const struct kernel_param *kp)
 {
@@ -318,11 +346,29 @@ static void tesvar_battery_forget(void *data)
 	spin_unlock(&tesvar_battery_lock);
 }
 
+static void tesvar_battery_unbind(void *data)
+{
+	clear_bit(0, &tesvar_battery_bound);
+}
+
 static int tesvar_battery_probe(struct platform_device *pdev)
 {
 	struct power_supply_config cfg = {};
 	struct power_supply_config ac_cfg = {};
 	struct power_supply *psy, *ac;
+	int ret;
+
+	/*
+	 * Another device given this driver (driver_override) is refused
+	 * before anything is created: its supplies would have the same names.
+	 */
+	if (test_and_set_bit(0, &tesvar_battery_bound))
+		return dev_err_probe(&pdev->dev, -EBUSY,
+				     "%s belongs to another device\n",
+				     TESVAR_BATTERY_SUPPLY);
+	ret = devm_add_action_or_reset(&pdev->dev, tesvar_battery_unbind, NULL);
+	if (ret)
+		return ret;
 
 	cfg.attr_grp = tesvar_battery_groups;
 	psy = devm_power_supply_register(&pdev->dev, &tesvar_battery_desc,

@@ -9,14 +9,43 @@ KOLVRAND_ROOT=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
 # roots debootstrap makes): outside the work tree, so a fresh clone reuses them.
 KOLVRAND_CACHE=${KOLVRAND_CACHE:-${XDG_CACHE_HOME:-$HOME/.cache}/kolvrand}
 
-# Debian packages the build and the tests need.
+# The Debian release this machine runs (bookworm, trixie), from os-release.
+debian_suite() {
+  (. /etc/os-release 2>/dev/null && echo "${VERSION_CODENAME:-}")
+}
+KOLVRAND_SUITE=$(debian_suite)
+
+# Debian packages the build and the tests need (umockdev: its preload
+# library, which the host-registry tests load; libzstd-dev: trixie's static
+# libcrypto is linked with zstd).
+# systemd: journalctl, whose own parser reads the message catalog in a test.
 KOLVRAND_PACKAGES=(cmake ninja-build g++ clang pkg-config libssl-dev nlohmann-json3-dev libumockdev-dev
-  libsystemd-dev libgtest-dev libgmock-dev protobuf-compiler libprotobuf-dev mandoc man-db
-  libxml2-utils)
+  umockdev libzstd-dev libsystemd-dev libgtest-dev libgmock-dev protobuf-compiler libprotobuf-dev
+  mandoc man-db libxml2-utils systemd)
+
+# release_package SUITE NAME...: each package's name in SUITE's archive, for
+# the names that differ between the releases the scripts run on; every
+# install_missing goes through it, so this is the one place they live.
+#   systemd-dev: trixie's package of systemd.pc and udev.pc, which bookworm
+#     ships in systemd and udev themselves;
+#   libssl3, libelf1: trixie's are libssl3t64 and libelf1t64 (its 64-bit
+#     time_t transition), as bookworm's kbuild packages name them.
+release_package() {
+  local suite=$1 p
+  shift
+  for p in "$@"; do
+    case $suite:$p in
+      bookworm:systemd-dev) echo systemd udev ;;
+      bookworm:libssl3t64 | bookworm:libelf1t64) echo "${p%t64}" ;;
+      trixie:libssl3 | trixie:libelf1) echo "${p}t64" ;;
+      *) echo "$p" ;;
+    esac
+  done
+}
 
 install_missing() {
-  local missing=()
-  for p in "$@"; do
+  local missing=() p
+  for p in $(release_package "$KOLVRAND_SUITE" "$@"); do
     dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q "install ok installed" || missing+=("$p")
   done
   [ ${#missing[@]} -eq 0 ] && return 0
@@ -124,4 +153,81 @@ cross_sysroot() {
   done
   rm -rf "$control"
   printf '%s\n' "${packages[@]}" >"$sysroot/.packages"
+}
+
+# Debian's mirror, for the roots of a release that this machine does not run.
+KOLVRAND_MIRROR=${KOLVRAND_MIRROR:-http://deb.debian.org/debian}
+KOLVRAND_SECURITY_MIRROR=${KOLVRAND_SECURITY_MIRROR:-http://deb.debian.org/debian-security}
+
+# suite_sources SUITE: apt's sources of a root of SUITE: the release, its
+# updates and security archives, and backports (whose packages apt takes only
+# when asked for by name, like the newer kernels).
+suite_sources() {
+  local suite=$1 key="[signed-by=/usr/share/keyrings/debian-archive-keyring.gpg]"
+  echo "deb $key $KOLVRAND_MIRROR $suite main"
+  echo "deb $key $KOLVRAND_MIRROR $suite-updates main"
+  echo "deb $key $KOLVRAND_SECURITY_MIRROR $suite-security main"
+  echo "deb $key $KOLVRAND_MIRROR $suite-backports main"
+}
+
+# suite_apt_state SUITE ARCH DIR [MORE ARCHES...]: as apt_state, but for
+# SUITE's archives (suite_sources) instead of this machine's sources.
+suite_apt_state() {
+  local suite=$1
+  shift
+  apt_state "$@"
+  suite_sources "$suite" >"$2/sources.list"
+  rm -f "$2"/sources.list.d/*
+}
+
+# make_root SUITE DIR LOG [PACKAGE,...]: a new Debian SUITE in DIR, as
+# debootstrap makes it (minbase, plus the packages named), its apt reading
+# suite_sources. The downloaded packages are kept in $KOLVRAND_CACHE for the
+# next root; the root itself is new. Needs root.
+make_root() {
+  local suite=$1 dir=$2 log=$3 include=${4:-}
+  local debs=$KOLVRAND_CACHE/debootstrap/$suite
+  mkdir -p "$debs"
+  install_missing debootstrap util-linux >>"$log"
+  # The mounts debootstrap makes vanish with its own mount namespace.
+  unshare --mount --propagation private debootstrap --variant=minbase \
+    ${include:+--include="$include"} --cache-dir="$debs" "$suite" "$dir" "$KOLVRAND_MIRROR" \
+    >>"$log" 2>&1 || { tail -n 40 "$log" >&2; echo "debootstrap $suite failed (log: $log)" >&2; return 1; }
+  suite_sources "$suite" >"$dir/etc/apt/sources.list"
+  cp /etc/resolv.conf "$dir/etc/resolv.conf"
+  # No service starts inside a root.
+  printf '#!/bin/sh\nexit 101\n' >"$dir/usr/sbin/policy-rc.d"
+  chmod +x "$dir/usr/sbin/policy-rc.d"
+}
+
+# run_in ROOT [--bind HOST:INSIDE]... [--] COMMAND...: COMMAND as root
+# chrooted into ROOT, in a mount and PID namespace of its own that end with
+# it: a /proc and /sys of its own, this machine's /dev, and the directories
+# bound in. The environment is a plain one (DEBIAN_FRONTEND, CI and
+# KOLVRAND_CACHE are passed on).
+run_in() {
+  local root=$1
+  shift
+  local binds=()
+  while [ $# -gt 0 ]; do
+    case $1 in
+      --bind) binds+=("$2"); shift 2 ;;
+      --) shift; break ;;
+      *) break ;;
+    esac
+  done
+  local script='set -e; root=$1; shift; n=$1; shift
+    mount --rbind /dev "$root/dev"
+    mount -t sysfs sysfs "$root/sys"
+    for _ in $(seq "$n"); do
+      mkdir -p "$1" "$root$2"; mount --bind "$1" "$root$2"; shift 2
+    done
+    exec chroot "$root" "$@"'
+  local args=() b
+  for b in "${binds[@]}"; do args+=("${b%%:*}" "${b#*:}"); done
+  unshare --mount --pid --fork --kill-child --propagation private --mount-proc="$root/proc" \
+    bash -c "$script" run_in "$root" "${#binds[@]}" "${args[@]}" \
+    /usr/bin/env -i PATH=/usr/local/sbin:/usr/local/bin:/usr/sbin:/usr/bin:/sbin:/bin HOME=/root \
+    DEBIAN_FRONTEND=noninteractive LC_ALL=C.UTF-8 TERM="${TERM:-dumb}" ${CI:+CI="$CI"} \
+    ${KOLVRAND_CACHE_IN:+KOLVRAND_CACHE="$KOLVRAND_CACHE_IN"} "$@"
 }

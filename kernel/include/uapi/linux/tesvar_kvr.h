@@ -10,10 +10,11 @@
  * Why an ioctl and not write(): the selector travels with the input, so a
  * caller names the method it means and an unknown one is refused as such
  * (EOPNOTSUPP) instead of being taken for a record; the input arrives whole
- * or not at all, with no short or partial writes to define; and the fd's
- * position and read() stay free. The record itself (29056 bytes) is far
- * larger than the 14-bit size field of an ioctl number can describe, so the
- * call carries a pointer to it.
+ * or not at all, with no short or partial writes to define; and read() stays
+ * free to give the kept record back (a file opened for reading reads the
+ * record kept when it was opened, whole). The record itself (29056 bytes) is
+ * far larger than the 14-bit size field of an ioctl number can describe, so
+ * the call carries a pointer to it.
  *
  * The structure has the same layout for 32-bit and 64-bit callers: fixed
  * width fields, the pointer carried as a 64-bit integer, naturally aligned,
