@@ -69,12 +69,12 @@ int integerBits(std::string_view length) {
 }
 
 template <typename T>
-void appendPrintf(std::string& out, const std::string& spec, T value) {
-  const int n = std::snprintf(nullptr, 0, spec.c_str(), value);
+void appendPrintf(std::string& out, const std::string& directive, T value) {
+  const int n = std::snprintf(nullptr, 0, directive.c_str(), value);
   if (n <= 0) return;
   const size_t at = out.size();
   out.resize(at + static_cast<size_t>(n) + 1);
-  std::snprintf(out.data() + at, static_cast<size_t>(n) + 1, spec.c_str(), value);
+  std::snprintf(out.data() + at, static_cast<size_t>(n) + 1, directive.c_str(), value);
   out.resize(at + static_cast<size_t>(n));
 }
 
@@ -116,7 +116,7 @@ std::string formatLogMessage(std::string_view format, std::span<const LogArg> ar
     const std::string_view length = format.substr(lengthAt, end - lengthAt);
     // The directive without its length modifier, which the argument's type
     // replaces.
-    std::string spec(format.substr(percent, lengthAt - percent));
+    std::string directive(format.substr(percent, lengthAt - percent));
     i = end + 1;
     if (conversion == '%') {
       out += '%';
@@ -134,7 +134,7 @@ std::string formatLogMessage(std::string_view format, std::span<const LogArg> ar
       case 'i': {
         const int shift = 64 - integerBits(length);
         const auto v = static_cast<int64_t>(std::visit(AsInteger{}, a.v) << shift) >> shift;
-        appendPrintf(out, spec + "lld", static_cast<long long>(v));
+        appendPrintf(out, directive + "lld", static_cast<long long>(v));
         break;
       }
       case 'u':
@@ -143,27 +143,27 @@ std::string formatLogMessage(std::string_view format, std::span<const LogArg> ar
       case 'o': {
         const int shift = 64 - integerBits(length);
         const uint64_t v = std::visit(AsInteger{}, a.v) << shift >> shift;
-        appendPrintf(out, spec + "ll" + conversion, static_cast<unsigned long long>(v));
+        appendPrintf(out, directive + "ll" + conversion, static_cast<unsigned long long>(v));
         break;
       }
       case 'c':
-        appendPrintf(out, spec + 'c', static_cast<int>(std::visit(AsInteger{}, a.v) & 0xff));
+        appendPrintf(out, directive + 'c', static_cast<int>(std::visit(AsInteger{}, a.v) & 0xff));
         break;
       case 'p':
         appendPrintf(
-            out, spec + 'p',
+            out, directive + 'p',
             reinterpret_cast<const void*>(static_cast<uintptr_t>(std::visit(AsInteger{}, a.v))));
         break;
       case 's':
       case '@':
-        if (spec.size() == 1) {
+        if (directive.size() == 1) {
           out += std::visit(AsText{}, a.v);
         } else {
-          appendPrintf(out, spec + 's', std::visit(AsText{}, a.v).c_str());
+          appendPrintf(out, directive + 's', std::visit(AsText{}, a.v).c_str());
         }
         break;
       default:
-        appendPrintf(out, spec + conversion, asDouble(a));
+        appendPrintf(out, directive + conversion, asDouble(a));
     }
   }
   return out;
