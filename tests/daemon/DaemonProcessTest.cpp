@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: MIT
 // The real daemon, run on simulated devices holding the example models: what
-// it prints on stderr, what it stores, and how it ends.
+// it prints on stderr, what it stores, and how it ends; and its handlers
+// called directly.
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -10,9 +11,11 @@
 #include "base/CommonCrypto.h"
 #include "base/Hex.h"
 #include "base/Value.h"
+#include "daemon/BatteryAgingActivity.h"
+#include "daemon/BatteryModelTask.h"
+#include "pipeline/DaemonIdentifier.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/TestDevice.h"
-#include "tests/tools/RunTool.h"
 
 namespace kolvrand {
 namespace {
@@ -29,70 +32,26 @@ struct Device : test::TestDevice {
   fs::path models() const { return dir() / "Library/KVR/BatteryModels"; }
 };
 
-// Starts the daemon, waits for one of `texts`, stops it with SIGTERM and
-// returns its lines; `before` runs once the text came, `wellFormed` says
-// whether every line had the exact "kolvrand[PID]: " prefix.
-Lines runDaemon(const Device& device, const std::string& levels,
-                std::initializer_list<std::string_view> texts,
-                const std::function<void(test::DaemonProcess&)>& before = {},
-                bool* wellFormed = nullptr) {
-  test::DaemonProcess daemon(device.dir(), levels);
-  EXPECT_TRUE(daemon.waitForLine(texts)) << daemon.rawStderr();
-  if (before) before(daemon);
+const std::string kBootUUID = "11111111-2222-3333-4444-555555555555";  // the device's
+
+// Once uploaded in this boot session, a start skips the upload. A log-level
+// setting with items it does not understand is named in one line and the
+// defaults apply: none of main's debug lines. Every line has the exact
+// "kolvrand[PID]: " prefix.
+TEST(Daemon, SkipsWithinTheBootSessionAndNamesALogLevelNotUnderstood) {
+  Device device;
+  test::writeFile(device.statePath(), json{{"savedBootUUID", kBootUUID}}.dump());
+  test::DaemonProcess daemon(device.dir(), "garbage,main=loud,main=debug");
+  EXPECT_TRUE(daemon.waitForLine({"Skipping"})) << daemon.rawStderr();
   daemon.signal(SIGTERM);
   EXPECT_EQ(daemon.waitForExit(), 0) << daemon.rawStderr();
-  return daemon.lines(wellFormed);
-}
-
-TEST(Daemon, UploadsOncePerBootSessionServesTheActivityAndStopsCleanly) {
-  Device device;
   bool wellFormed = false;
-  // The upload's last line first, so that it comes before the stop's however
-  // slowly the task runs (under an emulator, say).
-  Lines lines = runDaemon(
-      device, "debug", {"upload succeeded"},
-      [](test::DaemonProcess& daemon) {
-        ASSERT_TRUE(daemon.waitForLine({"checking in"}));
-        daemon.signal(SIGUSR1);
-        ASSERT_TRUE(daemon.waitForLine({"compensation has finished"}));
-      },
-      &wellFormed);
-  EXPECT_TRUE(wellFormed) << testing::PrintToString(lines);
-  // The task (the first three) and the activity run on threads of their own:
-  // each keeps its order, and the stop comes last.
-  const Lines expected = {
-      "debug [main] Battery data upload run for chemId 0x2168",
-      "debug [batteryModelDataHandling] -[BatteryModelDataHandler getBatteryModelFileURLString:] "
-      "workingDirURL resource: " +
-          (device.models() / "T618e/2168.rcmodel").string() + " ",
-      "default [main] Battery data upload succeeded",
-      "debug [main] battery aging update checking in! ",
-      "debug [main] battery aging periodic trigger",
-      "debug [main] trigger condition met, start to run some workload...",
-      "debug [main] battery aging compensation has finished successfully",
-      "debug [dispatch] stopping on signal 15"};
-  std::stable_partition(lines.begin(), lines.end(), [&](const std::string& l) {
-    return std::find(expected.begin(), expected.begin() + 3, l) != expected.begin() + 3;
-  });
-  EXPECT_EQ(lines, expected);
-  EXPECT_EQ(device.state(), (json{{"savedBootUUID", "11111111-2222-3333-4444-555555555555"},
-                                  {"savedChemID", 8552},
-                                  {"updateConditionMet", false}}));
-
-  EXPECT_EQ(runDaemon(device, "default", {"Skipping"}),
-            Lines{"default [main] Main Unchanged boot UUID. Skipping battery model task"});
-  // After a reboot it uploads again. A log-level setting with items it does
-  // not understand is named in one line, and the defaults apply.
-  json rebooted = test::defaultDeviceJSON();
-  rebooted["sysctl"]["kern.bootsessionuuid"] = "99999999-8888-7777-6666-555555555555";
-  device.writeDeviceJSON(rebooted);
-  Lines again =
-      runDaemon(device, "garbage,main=loud,batteryModelDataHandling=debug", {"upload succeeded"});
-  ASSERT_EQ(again.size(), 2u) << testing::PrintToString(again);
-  EXPECT_TRUE(again[0].starts_with(
-      "error [platform] KOLVRAND_LOG_LEVEL: \"garbage\", \"main=loud\" not understood"));
-  EXPECT_EQ(again[1], "default [main] Battery data upload succeeded");
-  EXPECT_EQ(device.state()["savedBootUUID"], rebooted["sysctl"]["kern.bootsessionuuid"]);
+  const Lines lines = daemon.lines(&wellFormed);
+  ASSERT_EQ(lines.size(), 2u) << daemon.rawStderr();
+  EXPECT_TRUE(wellFormed && lines[0].starts_with("error [platform] KOLVRAND_LOG_LEVEL: "
+                                                 "\"garbage\", \"main=loud\" not understood"))
+      << lines[0];
+  EXPECT_EQ(lines[1], "default [main] Main Unchanged boot UUID. Skipping battery model task");
 }
 
 // A datagram socket of a service manager's, as NOTIFY_SOCKET names one.
@@ -134,21 +93,12 @@ TEST(Daemon, TellsTheServiceManagerItIsReadyAndHowTheUploadEnded) {
       {"uploaded", nullptr, "uploaded and verified: chem ID 0x2168, SHA-1 "},
       {"already uploaded in this boot session",
        [](Device& d) {
-         test::writeFile(d.statePath(),
-                         json{{"savedBootUUID", "11111111-2222-3333-4444-555555555555"}}.dump());
+         test::writeFile(d.statePath(), json{{"savedBootUUID", kBootUUID}}.dump());
        },
        "skipped: already uploaded in this boot"},
       {"no model file", [](Device& d) { fs::remove_all(d.models()); },
        "failed: -[BatteryModelDataHandler getBatteryModelFileURLString:] <Error> file not present: "
        "DIR/Library/KVR/BatteryModels/T618e/2168.rcmodel"},
-      {"no battery driver",
-       [](Device& d) {
-         json j = test::defaultDeviceJSON();
-         j["registry"].erase("TesvarSmartBattery");
-         d.writeDeviceJSON(j);
-       },
-       "failed: -[BatteryModelDataHandler getIntValueForKeyFromBatteryData:] <Error> powerService "
-       "null"},
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(row.name);
@@ -169,44 +119,6 @@ TEST(Daemon, TellsTheServiceManagerItIsReadyAndHowTheUploadEnded) {
     EXPECT_EQ(heard, (std::vector<std::string>{"READY=1", "STATUS=" + status}));
     daemon.signal(SIGTERM);
     EXPECT_EQ(daemon.waitForExit(), 0) << daemon.rawStderr();
-  }
-}
-
-// Whoever sets the target type must not lead the daemon out of the Library:
-// a device type that is no directory name is answered as a missing file,
-// whatever lies where it points, and rcmodel status says the same.
-TEST(Daemon, DeviceTypeThatIsNoDirectoryNameNamesNoFile) {
-  const std::string kOld = "00000000-0000-0000-0000-000000000000";
-  for (std::string type : std::vector<std::string>{"..", ".", "", "a/b", "/ABS", "../../../x",
-                                                   std::string("x\0/../../../x", 14)}) {
-    SCOPED_TRACE(type);
-    Device device;
-    if (type == "/ABS") type = (device.dir() / "x").string();
-    // A chem ID outside the table, so the target type decides, and its model
-    // wherever the type would lead.
-    json j = test::defaultDeviceJSON();
-    j["registry"]["TesvarSmartBattery"]["BatteryData"]["AlgoChemID"] = 0x1234;
-    j["sysctl"]["hw.targettype"] = type;
-    device.writeDeviceJSON(j);
-    const std::string model = test::readFile(device.models() / "T618e/2168.rcmodel");
-    for (const fs::path& dir : {device.models(), device.models() / "a/b", device.dir() / "x",
-                                device.dir() / "Library/KVR"})
-      test::writeFile(dir / "1234.rcmodel", model);
-    test::writeFile(device.statePath(), json{{"savedBootUUID", kOld}}.dump());
-
-    const std::string handler = "error [batteryModelDataHandling] -[BatteryModelDataHandler ";
-    const std::string path = device.models().string() + "/" + type.c_str() + "/1234.rcmodel";
-    EXPECT_EQ(runDaemon(device, "error", {"upload succeeded", "upload failed"}),
-              (Lines{handler + "getBatteryModelFileURLString:] <Error> file not present: " + path,
-                     handler + "moveBatteryModelDataFromDiskToKext:] <Error> file (null) does "
-                               "not exist",
-                     "error [main] Battery data upload failed"}));
-    EXPECT_FALSE(fs::exists(device.dir() / "driver/battery_params.bin"));
-    EXPECT_EQ(device.state()["savedBootUUID"], kOld);
-
-    const test::ToolRun status = test::Scratch().rcmodel({"status"}, "", device.dir().string());
-    EXPECT_NE(status.out.find("\nmodel file exists:   no\n"), std::string::npos) << status.out;
-    EXPECT_NE(status.out.find("\nverdict:             missing\n"), std::string::npos) << status.out;
   }
 }
 
@@ -233,6 +145,66 @@ TEST(Daemon, ArgumentsAreAnsweredWithoutStartingTheDaemon) {
     EXPECT_EQ(daemon.rawStderr().empty(), c.err.empty());
     EXPECT_FALSE(fs::exists(device.dir() / "state") || fs::exists(device.dir() / "driver"));
   }
+}
+
+// The two handlers on simulated devices, where the daemon's own runs do not
+// go: each state of the battery-aging activity with each value of
+// "updateConditionMet", and the battery-model task without a handler or
+// defaults. (An unreadable boot session is crossed by the daemon's runs.)
+TEST(BatteryAgingActivity, EachStateLogsAndLeavesTheFlag) {
+  const std::string line[] = {"debug [main] battery aging update checking in! ",
+                              "debug [main] battery aging periodic trigger",
+                              "debug [main] trigger condition met, start to run some workload...",
+                              "debug [main] battery aging compensation has finished successfully"};
+  constexpr auto kIn = XPC_ACTIVITY_STATE_CHECK_IN, kRun = XPC_ACTIVITY_STATE_RUN,
+                 kWait = XPC_ACTIVITY_STATE_WAIT, kDone = XPC_ACTIVITY_STATE_DONE,
+                 kDefer = XPC_ACTIVITY_STATE_DEFER;
+  // The flag before and after: '-' absent, '0' false, '1' true; the lines
+  // logged as letters: C, T, W, F for the lines above. The last case has no agent: only the
+  // state is logged.
+  const struct {
+    xpc_activity_state_t state;
+    char before;
+    const char* logged;
+    char after;
+    bool agent = true;
+  } cases[] = {{kIn, '-', "C", '-'},    {kIn, '0', "C", '0'},     {kIn, '1', "CWF", '0'},
+               {kRun, '-', "TWF", '0'}, {kRun, '1', "TWF", '0'},  {kWait, '0', "", '0'},
+               {kDone, '-', "", '-'},   {kDefer, '1', "WF", '0'}, {kRun, '1', "T", '1', false}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(testing::Message() << c.state << c.before << c.agent);
+    test::TestDevice device;
+    auto agent = ConditionCheckingAgent::init();
+    ASSERT_TRUE(agent->defaults());
+    if (c.before != '-') agent->defaults()->setBool(c.before == '1', "updateConditionMet");
+    XPCActivity activity{"com.tesvar.kolvrand.batteryAgingUpdate", c.state};
+    batteryAgingActivityHandler(&activity, os_log_create(DaemonIdentifier, "main"),
+                                c.agent ? agent.get() : nullptr);
+    Lines expected;
+    for (const char* l = c.logged; *l; ++l)
+      expected.push_back(line[std::string_view("CTWF").find(*l)]);
+    EXPECT_EQ(device.logLines(), expected);
+    EXPECT_EQ(device.state().value("updateConditionMet", nlohmann::json()),
+              c.after == '-' ? nlohmann::json() : nlohmann::json(c.after == '1'));
+  }
+}
+
+TEST(BatteryModelTask, FailsWithoutAHandlerOrDefaults) {
+  test::TestDevice device;
+  runBatteryModelTask(os_log_create(DaemonIdentifier, "main"), nullptr);
+  EXPECT_EQ(device.logLines(), (Lines{"debug [main] Battery data upload run for chemId 0x0",
+                                      "error [main] Battery data upload failed"}));
+  EXPECT_FALSE(device.state().contains("savedBootUUID"));
+
+  device.clearLog();
+  std::filesystem::remove_all(device.dir() / "state");
+  test::writeFile(device.dir() / "state", "not a directory");
+  runBatteryModelTask(os_log_create(DaemonIdentifier, "main"),
+                      BatteryModelDataHandler::init().get());
+  const Lines lines = device.logLines();
+  ASSERT_FALSE(lines.empty());
+  EXPECT_EQ(lines.back(), "error [main] Could not allocate defaults");
+  EXPECT_EQ(std::count(lines.begin(), lines.end(), lines.back()), 1);
 }
 
 }  // namespace

@@ -66,6 +66,7 @@ TEST(DeviceType, OtherChemIDsFallBackToTheTargetType) {
       // Raw bytes without a NUL still end at the value's size.
       {{{"$data", "4a3432"}}, "J42", "debug " + kHandler + "Read HW type J42", true},
       {"..", "..", "debug " + kHandler + "Read HW type ..", false},
+      {".", ".", "debug " + kHandler + "Read HW type .", false},
       {"a/b", "a/b", "debug " + kHandler + "Read HW type a/b", false},
       {{{"$data", "4aff00"}}, std::nullopt, "debug " + kHandler + "Read HW type J\xff", false},
       {nullptr, std::nullopt,

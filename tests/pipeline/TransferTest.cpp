@@ -27,7 +27,7 @@ using nlohmann::json;
 // "none"; left out, the simulated driver publishes the hash of what it holds),
 // and the model file at T618e/2168.rcmodel. "@" stands for its full path. The
 // hashes there are made from the example record's SHA-1, which
-// ExampleModelBytesTest pins.
+// KextBatteryModelTest pins.
 TEST(Transfer, EachOutcomeLeavesItsChainTheDriverAndTheMark) {
   const auto model = makeExampleModel(0x2168);
   const std::string example = test::modelFile({model});

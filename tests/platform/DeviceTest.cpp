@@ -228,15 +228,6 @@ TEST(Defaults, ReadEachTypeOnlyAsItselfSeeWritesMadeElsewhereAndFailWithoutADire
   fs::create_directories(dir / "folder.json");
   auto folder = NSUserDefaults::initWithSuiteName("folder", dir);
   EXPECT_FALSE(folder->setBool(true, "k") || folder->boolForKey("k"));
-
-  // Opened for reading only, as tools do (crossed further by rcmodel status):
-  // nothing is written, not even a lock file.
-  fs::remove(d->path().string() + ".lock");
-  auto existing = NSUserDefaults::openExistingSuiteNamed(kSuite, dir);
-  ASSERT_TRUE(existing);
-  EXPECT_FALSE(existing->setObject("v", "s"));
-  EXPECT_EQ(existing->stringForKey("s"), "two");
-  EXPECT_FALSE(fs::exists(d->path().string() + ".lock"));
 }
 
 }  // namespace

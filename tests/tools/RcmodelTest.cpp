@@ -40,12 +40,17 @@ std::string exampleFile(void (*change)(OTAParamRC&) = nullptr) {
 class Rcmodel : public ::testing::Test {
  protected:
   // "good" is a full model, "cut" the same cut short, "short" a model the
-  // record builder refuses, "empty" an empty file, "j" wrong JSON.
+  // record builder refuses for three shortfalls, "empty" an empty file, "j"
+  // wrong JSON.
   void SetUp() override {
     const std::string good = exampleFile();
     writeFile(s / "good", good);
     writeFile(s / "cut", good.substr(0, good.size() / 2));
-    writeFile(s / "short", exampleFile([](OTAParamRC& m) { m.setR0(nullptr); }));
+    writeFile(s / "short", exampleFile([](OTAParamRC& m) {
+                m.setR0(nullptr);
+                m.r1()->setTemperatureCoeffs(m.r1()->temperatureCoeffs(), 152);
+                m.clearSlopeForR3Extraps();
+              }));
     writeFile(s / "empty", "");
     writeFile(s / "j", "{\"chemID\": 1, \"gridOCV\": [0.5, \"high\"]}");
     // A bare message whose last field (21, maxRdcRatio, a fixed32) breaks off.
