@@ -105,6 +105,17 @@ SuiteTable& suiteTable() {
   return *t;
 }
 
+// DIR/SUITE.json made absolute and normal, so that one file is one suite.
+std::shared_ptr<NSUserDefaults::Suite> makeSuite(std::string_view suite,
+                                                 const std::filesystem::path& dir) {
+  std::error_code ec;
+  const std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
+  auto s = std::make_shared<NSUserDefaults::Suite>();
+  s->path = ((ec ? dir : absolute) / (std::string(suite) + ".json")).lexically_normal();
+  s->lockPath = s->path.string() + ".lock";
+  return s;
+}
+
 }  // namespace
 
 std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(std::string_view suite) {
@@ -128,19 +139,12 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(
   }
   ::close(fd);
 
-  std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
-  if (ec) absolute = dir;
-  std::filesystem::path path = (absolute / (std::string(suite) + ".json")).lexically_normal();
-
+  std::shared_ptr<Suite> made = makeSuite(suite, dir);
   SuiteTable& table = suiteTable();
   std::lock_guard lock(table.mutex);
-  std::shared_ptr<Suite> shared = table.suites[path.string()].lock();
-  if (!shared) {
-    shared = std::make_shared<Suite>();
-    shared->path = path;
-    shared->lockPath = path.string() + ".lock";
-    table.suites[path.string()] = shared;
-  }
+  std::weak_ptr<Suite>& entry = table.suites[made->path.string()];
+  std::shared_ptr<Suite> shared = entry.lock();
+  if (!shared) entry = shared = made;
   return std::make_shared<NSUserDefaults>(std::move(shared));
 }
 
@@ -153,12 +157,7 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(
     std::string_view suite, const std::filesystem::path& dir, std::string* why) {
   if (why) why->clear();
   if (!validSuiteName(suite)) return nullptr;
-  std::error_code ec;
-  std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
-  if (ec) absolute = dir;
-  auto shared = std::make_shared<Suite>();
-  shared->path = (absolute / (std::string(suite) + ".json")).lexically_normal();
-  shared->lockPath = shared->path.string() + ".lock";
+  std::shared_ptr<Suite> shared = makeSuite(suite, dir);
   shared->readOnly = true;
   // A suite that is not there is no error; one that may be there but cannot
   // be read (a directory the caller may not search, a file it may not read)

@@ -11,7 +11,7 @@
 #include <nlohmann/json.hpp>
 #include <set>
 
-#include "platform/MessageIDs.h"
+#include "base/MessageIDs.h"
 #include "tests/support/Files.h"
 
 namespace kolvrand {
@@ -49,7 +49,7 @@ TEST(MessageIDs, KeyLinesFindTheirCatalogEntry) {
     if (row.is_string()) continue;
     const std::string line = row[0], subject = row[1];
     SCOPED_TRACE(line);
-    const std::string id(platform::messageIDFor(line));
+    const std::string id(messageIDFor(line));
     if (subject.empty()) {
       EXPECT_EQ(id, "");
       continue;
