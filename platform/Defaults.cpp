@@ -106,14 +106,10 @@ SuiteTable& suiteTable() {
 }
 
 // DIR/SUITE.json made absolute and normal, so that one file is one suite.
-std::shared_ptr<NSUserDefaults::Suite> makeSuite(std::string_view suite,
-                                                 const std::filesystem::path& dir) {
+std::filesystem::path suitePath(std::string_view suite, const std::filesystem::path& dir) {
   std::error_code ec;
   const std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
-  auto s = std::make_shared<NSUserDefaults::Suite>();
-  s->path = ((ec ? dir : absolute) / (std::string(suite) + ".json")).lexically_normal();
-  s->lockPath = s->path.string() + ".lock";
-  return s;
+  return ((ec ? dir : absolute) / (std::string(suite) + ".json")).lexically_normal();
 }
 
 }  // namespace
@@ -139,12 +135,16 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(
   }
   ::close(fd);
 
-  std::shared_ptr<Suite> made = makeSuite(suite, dir);
+  const std::filesystem::path path = suitePath(suite, dir);
   SuiteTable& table = suiteTable();
   std::lock_guard lock(table.mutex);
-  std::weak_ptr<Suite>& entry = table.suites[made->path.string()];
+  std::weak_ptr<Suite>& entry = table.suites[path.string()];
   std::shared_ptr<Suite> shared = entry.lock();
-  if (!shared) entry = shared = made;
+  if (!shared) {
+    entry = shared = std::make_shared<Suite>();
+    shared->path = path;
+    shared->lockPath = path.string() + ".lock";
+  }
   return std::make_shared<NSUserDefaults>(std::move(shared));
 }
 
@@ -157,7 +157,9 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(
     std::string_view suite, const std::filesystem::path& dir, std::string* why) {
   if (why) why->clear();
   if (!validSuiteName(suite)) return nullptr;
-  std::shared_ptr<Suite> shared = makeSuite(suite, dir);
+  auto shared = std::make_shared<Suite>();
+  shared->path = suitePath(suite, dir);
+  shared->lockPath = shared->path.string() + ".lock";
   shared->readOnly = true;
   // A suite that is not there is no error; one that may be there but cannot
   // be read (a directory the caller may not search, a file it may not read)
