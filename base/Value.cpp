@@ -1,9 +1,11 @@
 // SPDX-License-Identifier: MIT
 #include "base/Value.h"
 
+#include <algorithm>
 #include <bit>
 #include <charconv>
 #include <cmath>
+#include <cstdio>
 #include <limits>
 
 namespace kolvrand {
@@ -216,6 +218,35 @@ std::string Value::description() const {
   std::string out;
   renderValue(out, *this, kReadable);
   return out;
+}
+
+std::string joinPath(std::string_view outer, std::string_view inner) {
+  if (inner.empty()) return std::string(outer);
+  if (outer.empty()) return std::string(inner);
+  return std::string(outer) + (inner.front() == '[' ? "" : ".") + std::string(inner);
+}
+
+std::string dictionaryPathKey(const std::string& key) {
+  const bool name = !key.empty() && std::all_of(key.begin(), key.end(), [](char c) {
+    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_';
+  });
+  if (name) return key;
+  std::string out = "[\"";
+  for (unsigned char c : key) {
+    if (c == '"' || c == '\\') {
+      out += '\\';
+      out += static_cast<char>(c);
+    } else if (c == '\n' || c == '\t') {
+      out += c == '\n' ? "\\n" : "\\t";
+    } else if (c < 0x20 || c == 0x7f) {
+      char escape[8];
+      std::snprintf(escape, sizeof escape, "\\u%04x", c);
+      out += escape;
+    } else {
+      out += static_cast<char>(c);
+    }
+  }
+  return out + "\"]";
 }
 
 }  // namespace kolvrand

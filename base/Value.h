@@ -161,4 +161,25 @@ struct ValueTextStyle {
 };
 void renderValue(std::string& out, const Value& value, const ValueTextStyle& style);
 
+// Why a value could not be taken (into a message, or from JSON text), and
+// where: `path` is the keys from the value's root down, joined by '.', with
+// list positions as "[i]" ("R0.resistance25C[3]"; empty for the root itself,
+// "$" for the root of a JSON text, "line N: $" for a line of JSON Lines).
+struct ValueError {
+  std::string path;
+  std::string reason;
+  // The number the reason names, as its description reads ("4294967296"),
+  // so that a caller holding the text it came from can show it as written.
+  std::string number;
+  std::string message() const { return path + ": " + reason; }
+};
+
+// A key as ValueError paths show it: as it is when it is a name, else in
+// brackets as a JSON string (["a.b"], ["\u0000"]), so that no key reads as
+// two and none cuts a message short.
+std::string dictionaryPathKey(const std::string& key);
+// `inner` below `outer`: "R0" and "resistance25C[3]" give "R0.resistance25C[3]",
+// "$" and "[2]" give "$[2]".
+std::string joinPath(std::string_view outer, std::string_view inner);
+
 }  // namespace kolvrand

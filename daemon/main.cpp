@@ -6,6 +6,7 @@
 #include <string>
 #include <string_view>
 
+#include "base/LogTap.h"
 #include "daemon/BatteryAgingActivity.h"
 #include "daemon/BatteryModelTask.h"
 #include "daemon/ConditionCheckingAgent.h"
@@ -16,7 +17,6 @@
 #include "platform/Backend.h"
 #include "platform/Dispatch.h"
 #include "platform/Log.h"
-#include "platform/LogTap.h"
 #include "platform/ServiceManager.h"
 
 namespace {

@@ -166,8 +166,10 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
     FileError why;
     auto text = readFile(root_ / "device.json", &why);
     if (!text) return fail(error, "cannot read device.json: " + why.reason);
-    JSON doc = JSON::parse(*text, nullptr, false);
+    bool tooDeep = false;
+    JSON doc = JSON::parse(*text, jsonDepthLimit(&tooDeep), false);
     if (doc.is_discarded()) return fail(error, "device.json is not valid JSON");
+    if (tooDeep) return fail(error, "device.json is nested too deep");
     if (!doc.is_object()) return fail(error, "device.json is not an object");
 
     if (auto it = doc.find("sysctl"); it != doc.end()) {
@@ -177,11 +179,11 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
           kernel_[v.key()] = v->get<std::string>() + '\0';
           continue;
         }
-        std::string why;
+        ValueError why;
         auto value = v->is_object() ? valueFromJSON(*v, &why) : std::nullopt;
         if (!value || !value->isData())
           return fail(error, "sysctl " + v.key() + " is neither a string nor {\"$data\": HEX}" +
-                                 (why.empty() ? "" : " (" + why + ")"));
+                                 (why.reason.empty() ? "" : " (" + why.message() + ")"));
         const Data& d = *value->asData();
         kernel_[v.key()] = std::string(d.begin(), d.end());
       }
@@ -197,9 +199,10 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
             entry.absent.insert(p.key());
             continue;
           }
-          std::string why;
+          ValueError why;
           auto value = valueFromJSON(*p, &why);
-          if (!value) return fail(error, "registry " + c.key() + "." + p.key() + ": " + why);
+          if (!value)
+            return fail(error, "registry " + c.key() + "." + p.key() + ": " + why.message());
           entry.properties.set(p.key(), std::move(*value));
         }
         classes_.push_back(std::move(entry));

@@ -14,7 +14,7 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  rcmodel::JSONError error;
+  ValueError error;
   auto models = rcmodel::modelsFromJSON(std::string_view(reinterpret_cast<const char*>(data), size),
                                         false, &error);
   fuzz::check(models || !error.reason.empty());

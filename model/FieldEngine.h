@@ -13,7 +13,7 @@
 #include "model/PBDataWriter.h"
 
 namespace kolvrand {
-struct DictionaryError;
+struct ValueError;
 }
 
 namespace kolvrand::detail {
@@ -47,6 +47,6 @@ Value dictionaryOfFields(const MessageTable& table, ConstFields fields);
 // chemID-like fields from integral numbers in range, enums from their names,
 // "(unknown: N)" or a 32-bit integer.
 bool setFieldsFromDictionary(const MessageTable& table, MutableFields fields,
-                             const Value& dictionary, DictionaryError* error);
+                             const Value& dictionary, ValueError* error);
 
 }  // namespace kolvrand::detail

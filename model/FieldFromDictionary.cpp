@@ -18,16 +18,9 @@ namespace kolvrand::detail {
 
 namespace {
 
-bool fail(DictionaryError* error, std::string path, std::string reason) {
+bool fail(ValueError* error, std::string path, std::string reason) {
   if (error) *error = {std::move(path), std::move(reason), {}};
   return false;
-}
-
-// `inner` below `outer`: "R0" and "resistance25C[3]" give "R0.resistance25C[3]".
-std::string joinPath(std::string_view outer, std::string_view inner) {
-  if (inner.empty()) return std::string(outer);
-  if (outer.empty()) return std::string(inner);
-  return std::string(outer) + (inner.front() == '[' ? "" : ".") + std::string(inner);
 }
 
 std::string element(std::string_view key, size_t index) {
@@ -180,7 +173,7 @@ const FieldDescriptor* nearKey(const MessageTable& table, std::string_view key) 
 }
 
 bool setField(const FieldDescriptor& d, MutableFields fields, const Value& value,
-              DictionaryError* error) {
+              ValueError* error) {
   std::string reason, number;
   const auto fail = [&](std::string path, std::string why) {
     if (error) *error = {std::move(path), std::move(why), std::move(number)};
@@ -192,7 +185,7 @@ bool setField(const FieldDescriptor& d, MutableFields fields, const Value& value
       if (!value.isDictionary())
         return fail(d.key, std::string("expected an object (") + message->className() + "), got " +
                                describe(value));
-      DictionaryError inner;
+      ValueError inner;
       if (!message->setFieldsFromDictionary(value, &inner)) {
         number = std::move(inner.number);
         return fail(joinPath(d.key, inner.path), std::move(inner.reason));
@@ -238,7 +231,7 @@ bool setField(const FieldDescriptor& d, MutableFields fields, const Value& value
 }  // namespace
 
 bool setFieldsFromDictionary(const MessageTable& table, MutableFields fields,
-                             const Value& dictionary, DictionaryError* error) {
+                             const Value& dictionary, ValueError* error) {
   const Dictionary* entries = dictionary.asDictionary();
   if (!entries) return fail(error, "", "expected an object, got " + describe(dictionary));
   for (const auto& [key, value] : *entries) {
@@ -255,30 +248,3 @@ bool setFieldsFromDictionary(const MessageTable& table, MutableFields fields,
 }
 
 }  // namespace kolvrand::detail
-
-namespace kolvrand {
-
-std::string dictionaryPathKey(const std::string& key) {
-  const bool name = !key.empty() && std::all_of(key.begin(), key.end(), [](char c) {
-    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_';
-  });
-  if (name) return key;
-  std::string out = "[\"";
-  for (unsigned char c : key) {
-    if (c == '"' || c == '\\') {
-      out += '\\';
-      out += static_cast<char>(c);
-    } else if (c == '\n' || c == '\t') {
-      out += c == '\n' ? "\\n" : "\\t";
-    } else if (c < 0x20 || c == 0x7f) {
-      char escape[8];
-      std::snprintf(escape, sizeof escape, "\\u%04x", c);
-      out += escape;
-    } else {
-      out += static_cast<char>(c);
-    }
-  }
-  return out + "\"]";
-}
-
-}  // namespace kolvrand

@@ -42,12 +42,12 @@ class GeneratedMessage : public PBCodable {
   Value dictionaryRepresentation() const override {
     return dictionaryOfFields(Derived::table(), fields_.view());
   }
-  bool setFieldsFromDictionary(const Value& dictionary, DictionaryError* error) override {
+  bool setFieldsFromDictionary(const Value& dictionary, ValueError* error) override {
     return detail::setFieldsFromDictionary(Derived::table(), fields_.view(), dictionary, error);
   }
   // A new message from its dictionary form; nullptr with *error filled when
   // setFieldsFromDictionary fails.
-  static std::shared_ptr<Derived> fromDictionary(const Value& dictionary, DictionaryError* error) {
+  static std::shared_ptr<Derived> fromDictionary(const Value& dictionary, ValueError* error) {
     auto message = std::make_shared<Derived>();
     if (!message->setFieldsFromDictionary(dictionary, error)) return nullptr;
     return message;

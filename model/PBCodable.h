@@ -19,22 +19,6 @@ namespace detail {
 struct MessageTable;
 }
 
-// Why a dictionary could not be taken into a message, and where: `path` is the
-// keys from the message down, joined by '.', with list positions as "[i]"
-// ("R0.resistance25C[3]"); empty for the dictionary itself.
-struct DictionaryError {
-  std::string path;
-  std::string reason;
-  // The number the reason names, as its description reads ("4294967296"),
-  // so that a caller holding the text it came from can show it as written.
-  std::string number;
-};
-
-// A key as DictionaryError paths show it: as it is when it is a name, else in
-// brackets as a JSON string (["a.b"], ["\u0000"]), so that no key reads as
-// two and none cuts a message short.
-std::string dictionaryPathKey(const std::string& key);
-
 class PBCodable {
  public:
   PBCodable() = default;
@@ -65,7 +49,7 @@ class PBCodable {
   // as they are. An unknown key, a value of the wrong type or one out of range
   // fails with *error filled; the message is then partly set and should be
   // dropped.
-  virtual bool setFieldsFromDictionary(const Value& dictionary, DictionaryError* error) = 0;
+  virtual bool setFieldsFromDictionary(const Value& dictionary, ValueError* error) = 0;
   // The base description ("<Class: 0x...>"), a space, and the dictionary.
   virtual std::string description() const;
 

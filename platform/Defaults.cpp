@@ -105,6 +105,13 @@ SuiteTable& suiteTable() {
   return *t;
 }
 
+// DIR/SUITE.json made absolute and normal, so that one file is one suite.
+std::filesystem::path suitePath(std::string_view suite, const std::filesystem::path& dir) {
+  std::error_code ec;
+  const std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
+  return ((ec ? dir : absolute) / (std::string(suite) + ".json")).lexically_normal();
+}
+
 }  // namespace
 
 std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(std::string_view suite) {
@@ -128,18 +135,15 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::initWithSuiteName(
   }
   ::close(fd);
 
-  std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
-  if (ec) absolute = dir;
-  std::filesystem::path path = (absolute / (std::string(suite) + ".json")).lexically_normal();
-
+  const std::filesystem::path path = suitePath(suite, dir);
   SuiteTable& table = suiteTable();
   std::lock_guard lock(table.mutex);
-  std::shared_ptr<Suite> shared = table.suites[path.string()].lock();
+  std::weak_ptr<Suite>& entry = table.suites[path.string()];
+  std::shared_ptr<Suite> shared = entry.lock();
   if (!shared) {
-    shared = std::make_shared<Suite>();
+    entry = shared = std::make_shared<Suite>();
     shared->path = path;
     shared->lockPath = path.string() + ".lock";
-    table.suites[path.string()] = shared;
   }
   return std::make_shared<NSUserDefaults>(std::move(shared));
 }
@@ -153,11 +157,8 @@ std::shared_ptr<NSUserDefaults> NSUserDefaults::openExistingSuiteNamed(
     std::string_view suite, const std::filesystem::path& dir, std::string* why) {
   if (why) why->clear();
   if (!validSuiteName(suite)) return nullptr;
-  std::error_code ec;
-  std::filesystem::path absolute = std::filesystem::absolute(dir, ec);
-  if (ec) absolute = dir;
   auto shared = std::make_shared<Suite>();
-  shared->path = (absolute / (std::string(suite) + ".json")).lexically_normal();
+  shared->path = suitePath(suite, dir);
   shared->lockPath = shared->path.string() + ".lock";
   shared->readOnly = true;
   // A suite that is not there is no error; one that may be there but cannot

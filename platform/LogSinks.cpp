@@ -13,26 +13,18 @@
 #include <cstdlib>
 #include <mutex>
 
+#include "base/LogTap.h"
+#include "base/MessageIDs.h"
 #include "base/Utf8.h"
 #include "platform/FileManager.h"
-#include "platform/LogTap.h"
-#include "platform/MessageIDs.h"
 
 namespace kolvrand {
 
 namespace {
 
-const char* levelName(LogLevel level) {
-  switch (level) {
-    case LogLevel::Error:
-      return "error";
-    case LogLevel::Default:
-      return "default";
-    case LogLevel::Debug:
-      return "debug";
-  }
-  return "default";
-}
+// By LogLevel: the name on stderr and the journal's priority.
+constexpr const char* kLevelNames[] = {"error", "default", "debug"};
+constexpr const char* kPriorities[] = {"PRIORITY=3", "PRIORITY=5", "PRIORITY=7"};
 
 std::string_view withoutTrailingNewline(std::string_view message) {
   if (!message.empty() && message.back() == '\n') message.remove_suffix(1);
@@ -44,7 +36,8 @@ void writeStderrLine(LogLevel level, std::string_view category, std::string_view
   // never interleave, and a line is never split by another process's output
   // as long as it fits in a pipe buffer.
   static auto* mutex = new std::mutex;
-  std::string line = "kolvrand[" + std::to_string(::getpid()) + "]: " + levelName(level) + " [";
+  std::string line = "kolvrand[" + std::to_string(::getpid()) +
+                     "]: " + kLevelNames[static_cast<int>(level)] + " [";
   line.append(category);
   line += "] ";
   // One message, one line, and nothing a terminal would act on: text from
@@ -68,9 +61,7 @@ class JournalSink final : public LogSink {
  public:
   void write(LogLevel level, std::string_view subsystem, std::string_view category,
              std::string_view message) override {
-    const char* priority = level == LogLevel::Error     ? "PRIORITY=3"
-                           : level == LogLevel::Default ? "PRIORITY=5"
-                                                        : "PRIORITY=7";
+    const char* priority = kPriorities[static_cast<int>(level)];
     std::string sub = "KOLVRAND_SUBSYSTEM=";
     sub.append(subsystem);
     std::string cat = "KOLVRAND_CATEGORY=";
@@ -79,7 +70,7 @@ class JournalSink final : public LogSink {
     msg.append(withoutTrailingNewline(message));
     static const char identifier[] = "SYSLOG_IDENTIFIER=kolvrand";
     // The key lines carry the ID of their catalog entry (journalctl -x).
-    const std::string_view messageID = platform::messageIDFor(message);
+    const std::string_view messageID = messageIDFor(message);
     std::string id = "MESSAGE_ID=";
     id.append(messageID);
     auto iov = [](const void* p, size_t n) { return iovec{const_cast<void*>(p), n}; };

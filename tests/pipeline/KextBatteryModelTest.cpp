@@ -85,7 +85,7 @@ TEST(KextBatteryModel, EveryElementLandsAtItsOffsetAndNoFurther) {
       root.find(key.substr(0, dot))->asDictionary()->set(key.substr(dot + 1), std::move(v));
     }
     ASSERT_EQ(expected.size(), kKextBatteryModelSize);
-    DictionaryError why;
+    ValueError why;
     auto model = OTAParamRC::fromDictionary(root, &why);
     ASSERT_TRUE(model) << why.path << ": " << why.reason;
     if (bare) model->setHasMaxRdcRatio(false);

@@ -68,7 +68,7 @@ TEST(SimulatedDevice, KernelVariablesAndRegistryAreServedAsGiven) {
   EXPECT_EQ(data, Value(Dictionary{
                       {"Z", i(1)},
                       {"Big", Value(Number::fromUnsigned(UINT64_MAX))},
-                      {"F", Value(Number::fromDouble(0.5))},
+                      {"F", Value(Number::fromFloat(0.5f))},
                       {"On", Value(true)},
                       {"List", Value(Array{i(1), Value("two")})},
                       {"Raw", Value(Data{0x0a, 0xff})},

@@ -12,9 +12,9 @@
 #include <set>
 #include <thread>
 
+#include "base/MessageIDs.h"
 #include "base/Value.h"
 #include "platform/Log.h"
-#include "platform/MessageIDs.h"
 #include "tests/support/Files.h"
 #include "tests/support/TestDevice.h"
 
@@ -179,7 +179,7 @@ TEST(MessageIDs, KeyLinesFindTheirCatalogEntry) {
     if (row.is_string()) continue;
     const std::string line = row[0], subject = row[1];
     SCOPED_TRACE(line);
-    const std::string id(platform::messageIDFor(line));
+    const std::string id(messageIDFor(line));
     if (subject.empty()) {
       EXPECT_EQ(id, "");
       continue;

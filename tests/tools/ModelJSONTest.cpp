@@ -18,7 +18,6 @@
 namespace kolvrand {
 namespace {
 
-using rcmodel::JSONError;
 using rcmodel::modelsFromJSON;
 using rcmodel::renderJSON;
 constexpr float kInf = std::numeric_limits<float>::infinity();
@@ -83,7 +82,7 @@ TEST(ModelJSON, RandomModelsRoundTrip) {
     // The model read from the JSON has the very dictionary it came from: the
     // import is the exact reverse of the dictionary form, and every float
     // written reads back to the same bits.
-    JSONError error;
+    ValueError error;
     auto models = modelsFromJSON(json, true, &error);
     ASSERT_TRUE(models) << error.message();
     EXPECT_TRUE((*models)[0]->dictionaryRepresentation() == dictionary) << json;
@@ -113,7 +112,7 @@ TEST(ModelJSON, EachTextGivesItsModelOrThePathOfTheFirstWrongValue) {
                            "\"(unknown: )\"", "\"kkvrregularmlb\"", "2147483648", "1.5", "true"})
     cases.push_back({std::string("{\"MLBConfig\":") + json + "}", "$.MLBConfig", ""});
   for (const Case& c : cases) {
-    JSONError error;
+    ValueError error;
     auto models = modelsFromJSON(c.json, c.single, &error);
     const std::string shown = c.json.substr(0, 80);
     ASSERT_EQ(!models, !c.path.empty()) << shown << " -> " << error.message();

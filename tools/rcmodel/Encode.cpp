@@ -56,10 +56,10 @@ int run(const Arguments& a) {
   constexpr size_t kLimit = PBStreamReader::kMaxFileSize;
   std::vector<uint8_t> bytes;
   size_t used = 0;
-  JSONError why;
+  ValueError why;
   const bool ok = forEachModelInJSON(
       *text, a.raw, {kLimit, &used}, &why,
-      [&](std::shared_ptr<OTAParamRC> model, JSONError* refused) {
+      [&](std::shared_ptr<OTAParamRC> model, ValueError* refused) {
         const size_t size = model->encodedSize();
         const size_t framed = a.raw ? size : wire::varintSize(size) + size;
         if (framed > kLimit - used) {

@@ -2,8 +2,9 @@
 // The dictionary form of the model messages as JSON, both ways. Output: keys
 // in the message's field order, floats as the shortest decimal that reads back
 // to the same 32-bit float, NaN and the infinities as the strings "NaN",
-// "Infinity" and "-Infinity". Input: the same, through the model's own
-// dictionary import, so no field is listed here.
+// "Infinity" and "-Infinity". Input: the same, read by base/'s one JSON
+// conversion (ValueJSON.h) and the model's own dictionary import, so no field
+// is listed here. A ValueError's path starts at "$" (or "line N: $").
 #pragma once
 
 #include <functional>
@@ -27,27 +28,6 @@ std::string renderJSON(const Value& value);
 // back as the integer 0), quoted names for NaN and the infinities.
 std::string floatJSON(float value);
 
-// Where in the JSON text a value went wrong: "$" for the whole text (or
-// "line N: $" for a line of JSON Lines), then ".key" and "[index]" down to the
-// value; a syntax error names its line and column in `reason`.
-struct JSONError {
-  std::string path;
-  std::string reason;
-  std::string message() const { return path + ": " + reason; }
-};
-
-// JSON text as a Value: every number that is an integer, however written
-// (12, 1.2e1, 12.0), becomes an integer of exactly its value when it fits 64
-// bits; any other number becomes the 32-bit float nearest to its decimal text
-// when it is within a float's range (else a double, which a float field
-// rounds or refuses, and never zero for a number that is not), negative zero
-// a float; the strings "NaN", "Infinity" and "-Infinity" become floats. Null,
-// duplicate keys and numbers beyond any range are errors.
-std::optional<Value> parseJSON(std::string_view text, JSONError* error);
-
-// `path` below `root`: "$" and "R0.resistance25C[3]" give "$.R0.resistance25C[3]".
-std::string below(const std::string& root, const std::string& path);
-
 // What the models of a text may take once encoded: `limit` bytes, of which
 // *used are taken already (the caller counts what it has encoded); no limit
 // without `used`.
@@ -57,7 +37,7 @@ struct ModelBudget {
 };
 
 // Takes one model; false after setting the error's reason stops the reading.
-using TakeModel = std::function<bool(std::shared_ptr<OTAParamRC>, JSONError*)>;
+using TakeModel = std::function<bool(std::shared_ptr<OTAParamRC>, ValueError*)>;
 
 // The models of a JSON text: an object is one model, an array of objects
 // several, and so are JSON Lines, one object a line (what rcmodel decode
@@ -67,11 +47,11 @@ using TakeModel = std::function<bool(std::shared_ptr<OTAParamRC>, JSONError*)>;
 // values of one model at a time; with a budget, a model whose encoding cannot
 // fit what is left of it is refused while it is read.
 bool forEachModelInJSON(std::string_view text, bool single, const ModelBudget& budget,
-                        JSONError* error, const TakeModel& take);
+                        ValueError* error, const TakeModel& take);
 
 // The same, all models kept.
 std::optional<std::vector<std::shared_ptr<OTAParamRC>>> modelsFromJSON(std::string_view text,
                                                                        bool single,
-                                                                       JSONError* error);
+                                                                       ValueError* error);
 
 }  // namespace kolvrand::rcmodel

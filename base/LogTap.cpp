@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: MIT
-#include "platform/LogTap.h"
+#include "base/LogTap.h"
 
 namespace kolvrand {
 

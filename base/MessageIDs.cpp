@@ -2,9 +2,9 @@
 // The lines are known by their fixed part, so the call sites and their
 // formats stay as they are. Each ID must have its entry in
 // packaging/catalog/kolvrand.catalog (a test holds the two together).
-#include "platform/MessageIDs.h"
+#include "base/MessageIDs.h"
 
-namespace kolvrand::platform {
+namespace kolvrand {
 
 namespace {
 
@@ -64,4 +64,4 @@ std::string_view messageIDFor(std::string_view message) {
   return {};
 }
 
-}  // namespace kolvrand::platform
+}  // namespace kolvrand

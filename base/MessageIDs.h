@@ -5,10 +5,10 @@
 
 #include <string_view>
 
-namespace kolvrand::platform {
+namespace kolvrand {
 
 // The 32 hex digits of the line's message ID; empty for a line without one.
 // `message` is the formatted text, a trailing line feed allowed.
 std::string_view messageIDFor(std::string_view message);
 
-}  // namespace kolvrand::platform
+}  // namespace kolvrand
