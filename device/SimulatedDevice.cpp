@@ -167,7 +167,9 @@ class SimulatedDevice final : public Backend, public KernelVariables, public Reg
     auto text = readFile(root_ / "device.json", &why);
     if (!text) return fail(error, "cannot read device.json: " + why.reason);
     bool tooDeep = false;
-    JSON doc = JSON::parse(*text, jsonDepthLimit(&tooDeep), false);
+    // Read as a view, through the lexer the JSON conversion uses: one copy of
+    // it in the daemon.
+    JSON doc = JSON::parse(std::string_view(*text), jsonDepthLimit(&tooDeep), false);
     if (doc.is_discarded()) return fail(error, "device.json is not valid JSON");
     if (tooDeep) return fail(error, "device.json is nested too deep");
     if (!doc.is_object()) return fail(error, "device.json is not an object");

@@ -82,7 +82,9 @@ JSON readSuite(const std::filesystem::path& path) {
       os_log_error(defaultsLog(), "cannot read %s: %s\n", path.string(), error.reason);
     return JSON::object();
   }
-  JSON j = JSON::parse(*text, nullptr, false);
+  // Read as a view, through the lexer the JSON conversion uses: one copy of
+  // it in the daemon.
+  JSON j = JSON::parse(std::string_view(*text), nullptr, false);
   if (j.is_discarded() || !j.is_object()) {
     os_log_error(defaultsLog(), "%s is not a JSON object; reading it as empty\n", path.string());
     return JSON::object();
