@@ -19,7 +19,6 @@
 namespace kolvrand {
 namespace {
 
-using Lines = std::vector<std::string>;
 
 // The record's fields in order, by dictionary key, with their sizes in 4-byte
 // words; a resistance table is 51 + 153 words. One word is a scalar.
@@ -91,7 +90,7 @@ TEST(KextBatteryModel, EveryElementLandsAtItsOffsetAndNoFurther) {
     if (bare) model->setHasMaxRdcRatio(false);
     auto record = BatteryModelDataHandler::init()->createKextModelFromProtobufModel(model.get());
     ASSERT_TRUE(record);
-    EXPECT_EQ(device.logLines(), Lines{});
+    EXPECT_EQ(device.logLines(), std::vector<std::string>{});
     const auto* bytes = reinterpret_cast<const uint8_t*>(record.get());
     const auto differs = std::mismatch(expected.begin(), expected.end(), bytes).first;
     EXPECT_TRUE(differs == expected.end()) << "at byte " << differs - expected.begin();

@@ -9,7 +9,6 @@
 #include "pipeline/PBStreamReader.h"
 #include "platform/Sysctl.h"
 #include "tests/support/Files.h"
-#include "tests/support/ModelFiles.h"
 #include "tests/support/TestDevice.h"
 
 namespace kolvrand {

@@ -10,7 +10,6 @@
 #include "platform/Defaults.h"
 #include "platform/IOKit.h"
 #include "platform/Sysctl.h"
-#include "tests/support/Files.h"
 #include "tests/support/TestDevice.h"
 
 namespace kolvrand {
@@ -166,20 +165,6 @@ TEST(SimulatedDriver, KeepsOnlyTheRecordAndPublishesItsHash) {
   device.reload();
   EXPECT_EQ(IOServiceOpen(kvr, mach_task_self(), 0, &c), kIOReturnError);
   EXPECT_EQ(c, 0u);
-}
-
-TEST(HostBackend, BootSessionIsTheKernelBootIdAndThereIsNoDriver) {
-  platform::setBackend(platform::makeHostBackend());
-  std::string bootId = test::readFile("/proc/sys/kernel/random/boot_id");
-  EXPECT_EQ(
-      readSysctl("kern.bootsessionuuid"),
-      bootId.empty() ? std::nullopt : std::optional(bootId.substr(0, bootId.size() - 1) + '\0'));
-  // The board's name, where the host has one, ends in a single NUL.
-  const auto type = readSysctl("hw.targettype");
-  EXPECT_TRUE(!type || (type->size() > 1 && type->find('\0') == type->size() - 1));
-  EXPECT_FALSE(readSysctl("kern.nosuchvariable"));
-  EXPECT_EQ(service("TesvarKVR"), 0u);
-  platform::setBackend(nullptr);
 }
 
 constexpr const char* kSuite = "com.tesvar.kolvrand";

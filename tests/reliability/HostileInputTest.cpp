@@ -29,6 +29,7 @@
 
 #include <regex>
 
+#include "base/Hex.h"
 #include "base/Utf8.h"
 #include "tests/support/ExampleDevice.h"
 
@@ -63,17 +64,10 @@ std::vector<Case> rows() {
   return out;
 }
 
-std::string fromHex(const std::string& hex) {
-  std::string out;
-  for (size_t i = 0; i < hex.size();) {
-    if (hex[i] == ' ') {
-      ++i;
-      continue;
-    }
-    out += static_cast<char>(std::stoi(hex.substr(i, 2), nullptr, 16));
-    i += 2;
-  }
-  return out;
+// Hex text, its bytes apart by spaces or not.
+std::string hexBytes(std::string hex) {
+  std::erase(hex, ' ');
+  return fromHex(hex).value();
 }
 
 std::string varint(uint64_t n) {
@@ -90,7 +84,7 @@ std::string exampleModel(const Row& what) {
     // The first message's length is one varint; its body grows by the bytes.
     size_t at = 0;
     while (static_cast<uint8_t>(bytes[at]) & 0x80) ++at;
-    const std::string body = bytes.substr(at + 1) + fromHex(what["hex"]);
+    const std::string body = bytes.substr(at + 1) + hexBytes(what["hex"]);
     bytes = varint(body.size()) + body;
   }
   if (how == "half") return bytes.substr(0, bytes.size() / 2);
@@ -138,7 +132,7 @@ void give(const fs::path& path, const Row& what, std::vector<int>* locks) {
     for (size_t i = 0; i < what["times"].get<size_t>(); ++i) text += what["repeat"];
     writeFile(path, text);
   }
-  if (what.contains("hex") && !what.contains("example")) writeFile(path, fromHex(what["hex"]));
+  if (what.contains("hex") && !what.contains("example")) writeFile(path, hexBytes(what["hex"]));
 }
 
 // Makes the device usable by nobody, except what is unreadable; the command

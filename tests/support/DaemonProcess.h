@@ -29,17 +29,13 @@ class DaemonProcess {
   // (its first word an absolute path), such as setpriv to drop privileges;
   // `env` holds further "NAME=VALUE" variables.
   DaemonProcess(const std::filesystem::path& device, const std::string& logLevel = "debug",
-                std::vector<std::string> launcher = {}, std::vector<std::string> args = {},
-                const std::vector<std::string>& env = {})
-      : stderrPath_(device / "daemon.stderr"), stdoutPath_(device / "daemon.stdout") {
+                std::vector<std::string> launcher = {}, const std::vector<std::string>& env = {})
+      : stderrPath_(device / "daemon.stderr") {
     // A previous run's stderr must not be read as this one's: posix_spawn may
     // return before the child has opened the file (it does under qemu-user).
     std::filesystem::remove(stderrPath_);
-    std::filesystem::remove(stdoutPath_);
     launcher.push_back(daemonBinary().string());
-    launcher.insert(launcher.end(), args.begin(), args.end());
-    pid_ = spawnProgram(launcher, DaemonEnvironment(device, logLevel, env),
-                        {{}, stdoutPath_, stderrPath_});
+    pid_ = spawnProgram(launcher, DaemonEnvironment(device, logLevel, env), {{}, {}, stderrPath_});
     running_ = pid_ > 0;
   }
   ~DaemonProcess() {
@@ -66,7 +62,6 @@ class DaemonProcess {
   }
 
   std::string rawStderr() const { return readFile(stderrPath_); }
-  std::string rawStdout() const { return readFile(stdoutPath_); }
 
   // Lines as "LEVEL [category] text"; false when a line lacks the exact
   // "kolvrand[PID]: " prefix.
@@ -104,7 +99,7 @@ class DaemonProcess {
     return false;
   }
 
-  std::filesystem::path stderrPath_, stdoutPath_;
+  std::filesystem::path stderrPath_;
   pid_t pid_ = -1;
   bool running_ = false;
 };

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: MIT
 // A simulated device in a temporary directory, installed as the platform
-// backend for the test's duration, and a log sink that keeps every message.
+// backend for the test's duration; a log sink that keeps every message; and
+// model files made in tests.
 #pragma once
 
 #include <filesystem>
@@ -11,6 +12,8 @@
 #include <string>
 #include <vector>
 
+#include "model/OTAParamRC.h"
+#include "pipeline/PBStreamWriter.h"
 #include "platform/Backend.h"
 #include "platform/Log.h"
 #include "tests/support/Files.h"
@@ -42,6 +45,13 @@ class LogCapture : public LogSink {
   mutable std::mutex mutex_;
   std::vector<std::string> lines_;
 };
+
+// A model file of `messages`.
+inline std::string modelFile(const std::vector<std::shared_ptr<OTAParamRC>>& messages) {
+  std::vector<uint8_t> bytes =
+      PBStreamWriter::dataForMessages(std::span<const std::shared_ptr<OTAParamRC>>(messages));
+  return std::string(bytes.begin(), bytes.end());
+}
 
 // The device of examples/device, with every field a test may change.
 inline nlohmann::json defaultDeviceJSON() {

@@ -13,7 +13,6 @@
 #include "daemon/BatteryModelTask.h"
 #include "model/OTAParamRC.h"
 #include "pipeline/DaemonIdentifier.h"
-#include "tests/support/ModelFiles.h"
 #include "tests/support/TestDevice.h"
 #include "tests/tools/RunTool.h"
 #include "tools/example_models/ExampleModel.h"
@@ -58,22 +57,6 @@ class Rcmodel : public ::testing::Test {
   }
   test::Scratch s;
 };
-
-// decode then encode gives the same file, of one message or several, and of
-// one bare message as protoc reads and writes it.
-TEST_F(Rcmodel, DecodeThenEncodeGivesTheSameFile) {
-  const fs::path examples = fs::path(KOLVRAND_SOURCE_DIR) / "examples/models";
-  const std::string one = readFile(examples / "R72/1608a.rcmodel");
-  for (const std::string& bytes : {one, one + readFile(examples / "K517/1821.rcmodel") +
-                                            readFile(examples / "T604/1886.rcmodel")}) {
-    writeFile(s / "in", bytes);
-    EXPECT_EQ(s.rcmodel({"encode", "-", "-o", "-"}, s.rcmodel({"decode", "in"}).out).out, bytes);
-  }
-  const std::vector<uint8_t> data = makeExampleModel(0x1608)->data();
-  const std::string bare(data.begin(), data.end());
-  const std::string json = s.rcmodel({"decode", "--raw", "-"}, bare).out;
-  EXPECT_EQ(s.rcmodel({"encode", "--raw", "-", "-o", "-"}, json).out, bare);
-}
 
 // What each use returns and prints, in rcmodel_uses.json: per use (strings
 // between them are comments) the exit status, the arguments, what stderr must
