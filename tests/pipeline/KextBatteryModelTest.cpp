@@ -19,7 +19,6 @@
 namespace kolvrand {
 namespace {
 
-
 // The record's fields in order, by dictionary key, with their sizes in 4-byte
 // words; a resistance table is 51 + 153 words. One word is a scalar.
 std::vector<std::pair<std::string, size_t>> recordSlots() {
